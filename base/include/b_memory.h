@@ -42,8 +42,8 @@ void alignedDeallocate(void* pointer);
 } // namespace detail
 
 template <std::size_t Alignment>
-void* StdAlignAllocPolicy<Alignment>::allocateBytes(std::size_t size, const char*, int,
-                                                    const char*, std::uint32_t) {
+void* StdAlignAllocPolicy<Alignment>::allocateBytes(std::size_t size, const char*, int, const char*,
+                                                    std::uint32_t) {
     return detail::alignedAllocate(size, Alignment);
 }
 template <std::size_t Alignment>

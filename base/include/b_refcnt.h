@@ -82,11 +82,11 @@ public:
     ref(const ref& other) noexcept : ref(other.m_p) {}
     ref(ref&& other) noexcept : m_p(std::exchange(other.m_p, nullptr)) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    ref(const ref<U>& other) noexcept : ref(static_cast<T*>(other.get())) {}
+    requires std::is_convertible_v<U*, T*> ref(const ref<U>& other)
+    noexcept : ref(static_cast<T*>(other.get())) {}
     template <class U>
-        requires std::is_convertible_v<U*, T*>
-    ref(ref<U>&& other) noexcept : m_p(other.detach()) {}
+    requires std::is_convertible_v<U*, T*> ref(ref<U>&& other)
+    noexcept : m_p(other.detach()) {}
     ~ref() { reset(); }
 
     ref& operator=(const ref& other) noexcept {

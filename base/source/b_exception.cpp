@@ -51,16 +51,15 @@ string qualifiedName(const char* function) {
 }
 } // namespace
 
-exception::exception(string message, const char* file, std::uint32_t line,
-                     const char* function)
+exception::exception(string message, const char* file, std::uint32_t line, const char* function)
     : m_line(line), m_file(file ? file : ""), m_function(qualifiedName(function)),
       m_message(std::move(message)) {
     stackWalker().appendCallStack(m_callStack, 1);
 }
 
 void exception::log(ILog& log) const {
-    logFormatted(log, logSystem, logError, "{}\n    File: {} ({})\nFunction: {}", m_message,
-                 m_file, m_line, m_function);
+    logFormatted(log, logSystem, logError, "{}\n    File: {} ({})\nFunction: {}", m_message, m_file,
+                 m_line, m_function);
     logCallStack(log);
 }
 

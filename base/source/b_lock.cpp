@@ -41,8 +41,7 @@ void readUnlock(LockWord& word) noexcept {
         std::uint32_t count = w & kReaders;
         if (count == 0)
             return;
-        if (word.compare_exchange_weak(w, (w & kWaiting) | (count - 1),
-                                       std::memory_order_release))
+        if (word.compare_exchange_weak(w, (w & kWaiting) | (count - 1), std::memory_order_release))
             return;
         spinBackOff(spins);
     }

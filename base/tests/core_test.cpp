@@ -197,8 +197,7 @@ TEST(CoreException, LogsMessagePositionAndFunction) {
         string expected = format("file name not provided()\n    File: {} ({})\nFunction: {}\n",
                                  e.file(), e.line(), e.function());
         EXPECT_EQ(lines[0], expected);
-        EXPECT_NE(e.function().find("CoreException_LogsMessagePositionAndFunction"),
-                  string::npos);
+        EXPECT_NE(e.function().find("CoreException_LogsMessagePositionAndFunction"), string::npos);
         EXPECT_EQ(e.function().find('('), string::npos);
     }
     capture.clear();

@@ -24,8 +24,7 @@ enum SeekOrigin : std::uint32_t { seekBegin = 0, seekCurrent = 1, seekEnd = 2 };
 
 class StreamWorker : public RefCntAtomic, public AllocObject<> {
 public:
-    explicit StreamWorker(std::string_view name, std::uint32_t caps)
-        : m_caps(caps), m_name(name) {}
+    explicit StreamWorker(std::string_view name, std::uint32_t caps) : m_caps(caps), m_name(name) {}
 
     virtual std::uint64_t read(void* buffer, std::uint64_t bytes) = 0;
     virtual std::uint64_t write(const void* buffer, std::uint64_t bytes) = 0;
