@@ -107,10 +107,6 @@ public:
 
 private:
     PluginFactory& m_factory;
-    // By id: the name the object is written under (null: by id). Built on
-    // first use, so writes without references pay nothing.
-    vector<const string*> m_names;
-    bool m_indexed = false;
 };
 
 // Ids of the objects of a factory by name (the first object carrying it).
@@ -151,7 +147,7 @@ private:
     PluginFactory& m_factory;
     data_io_detail::NameIndex m_names;
     data_io_detail::NameIndex m_pending; // name -> placeholder id
-    vector<Deferred> m_deferred; // by placeholder id - firstReservedId
+    vector<Deferred> m_deferred;         // by placeholder id - firstReservedId
     std::size_t m_unknown = 0;
     bool m_defer = false;
 };

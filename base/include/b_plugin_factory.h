@@ -15,7 +15,9 @@
 // " Creating a general plugin with limited functionality..." when a placeholder
 // is made. Placeholder descriptors (DummyPluginDesc) are made once per type.
 // Ids are consecutive: the first free slot at the end of the table. A
-// descriptor whose create throws or answers null leaves no slot behind.
+// descriptor whose create throws or answers null leaves no object behind: its
+// slot is given back, or stays empty when objects that the descriptor made on
+// the way already follow it. Exceptions of a descriptor propagate.
 //
 // Lifetime: each table slot holds one strong reference. When the last
 // reference to the factory goes, it first forgets itself in every object it
@@ -33,11 +35,12 @@
 // carries that name, else the trailing digits of 'base' are cut and a counter
 // starting at their value + 1 (1 without digits) is appended until the name is
 // free: node, node1, node2; Arm2, Arm3. The answer is not reserved: it counts
-// once an object carries it. The set of names is kept up to date incrementally
-// from the objects registered since the last one found named, and a name an
-// object drops stays taken. The counter search resumes where the previous
-// search with the same stem and start stopped, so naming many objects alike
-// stays linear.
+// once an object carries it. Only objects in the instance table count. The set
+// of names is kept up to date incrementally from the objects registered since
+// the last one found named (unnamed objects at the end of the table are looked
+// at again on the next request), and a name an object drops stays taken. The
+// counter search resumes where the previous search with the same stem and
+// start stopped, so naming many objects alike stays linear.
 #pragma once
 
 #include "b_attrib_map.h"

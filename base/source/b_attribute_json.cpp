@@ -267,8 +267,8 @@ public:
     // 'split': whether the key is "name^type" (maps) or a type alone (arrays).
     // False when the key names no registered type or no usable name; 'name'
     // and 'type' then hold the texts for the message.
-    bool resolve(const AttribFactory* factory, std::string_view key, bool split,
-                 Resolved& resolved, std::string_view& name, std::string_view& type) {
+    bool resolve(const AttribFactory* factory, std::string_view key, bool split, Resolved& resolved,
+                 std::string_view& name, std::string_view& type) {
         const std::size_t at = split ? key.rfind('^') : std::string_view::npos;
         name = !split ? std::string_view() : at == key.npos ? key : key.substr(0, at);
         type = !split ? key : at == key.npos ? std::string_view() : key.substr(at + 1);
@@ -631,40 +631,16 @@ const string* objectName(const IPlugin& plugin) {
 } // namespace
 
 std::string_view PluginWriterResolveStringId::resolve(std::uint32_t id) {
-    if (!m_indexed) {
-        m_indexed = true;
-        const std::uint32_t count = m_factory.pluginCount();
-        m_names.assign(count, nullptr);
-        // Open addressing over the ids of the first carriers: one block for the
-        // whole table, where a node-based set would allocate per name.
-        struct Slot {
-            std::size_t hash;
-            const string* name; // null: free
-        };
-        std::size_t mask = 15;
-        while (mask < std::size_t(count) * 2)
-            mask = mask * 2 + 1;
-        vector<Slot> slots(mask + 1, Slot{0, nullptr});
-        for (std::uint32_t i = 0; i < count; ++i) {
-            const ref<IPlugin> plugin = m_factory.plugin(i);
-            // Objects that are not written cannot be found by name.
-            if (!plugin || plugin->hasFlag(Attribute::flagTransient))
-                continue;
-            const string* name = objectName(*plugin);
-            if (!name)
-                continue;
-            const std::size_t hash = data_io_detail::TextHash()(*name);
-            std::size_t at = hash & mask;
-            while (slots[at].name && (slots[at].hash != hash || *slots[at].name != *name))
-                at = (at + 1) & mask;
-            if (slots[at].name)
-                continue; // a later carrier of a name travels by id
-            slots[at] = {hash, name};
-            // The factory keeps the object, and so its name, alive.
-            m_names[i] = name;
-        }
-    }
-    return id < m_names.size() && m_names[id] ? std::string_view(*m_names[id]) : std::string_view();
+    const ref<IPlugin> plugin = m_factory.plugin(id);
+    // An object that is not written cannot be found by name.
+    if (!plugin || plugin->hasFlag(Attribute::flagTransient))
+        return {};
+    const string* name = objectName(*plugin);
+    // Read back, a name finds the first object carrying it (the factory's
+    // name service answers the same): any other carrier travels by id. The
+    // factory keeps the object, and so its name, alive.
+    return name && m_factory.findPlugin(*name) == plugin ? std::string_view(*name)
+                                                         : std::string_view();
 }
 
 std::uint32_t PluginReaderResolveStringId::resolve(std::string_view name,
@@ -836,16 +812,17 @@ bool readFactory(PluginFactory& factory, Stream& stream) {
                                  line);
                         break;
                     }
-                    // Only an object makes an object: nothing is created for
-                    // a member that could not be read into one.
+                    // Objects come in runs of one type: intern each run once,
+                    // before the next call on the reader ends the key. Only an
+                    // object makes an object: nothing is created for a member
+                    // that could not be read into one.
+                    const bool named = usableName(type);
+                    if (named && type != lastType.view())
+                        lastType = name_id(type);
                     ref<IPlugin> plugin;
-                    if (usableName(type) && reader.objectFollows()) {
-                        // Objects come in runs of one type: intern each run once.
-                        if (type != lastType.view())
-                            lastType = name_id(type);
+                    if (named && reader.objectFollows())
                         plugin = factory.create(lastType, PluginFactory::createReportUnknown |
                                                               PluginFactory::createLocked);
-                    }
                     const std::uint32_t depth = reader.depth();
                     if (!plugin) {
                         complain("Error reading plugin!", line);

@@ -287,9 +287,12 @@ struct JSONAttrReader::Impl {
     }
 
     void digits() {
+        // Runs within the buffer go in one append.
         while (isDigit(peek())) {
-            text += char(*cursor);
-            take();
+            const char* run = cursor;
+            while (cursor != end && isDigit(*cursor))
+                ++cursor;
+            text.append(run, std::size_t(cursor - run));
         }
     }
 

@@ -27,6 +27,10 @@ DataWriterResolveStringId& defaultWriterResolver() {
     return resolver;
 }
 
+} // namespace
+
+namespace json_detail {
+
 // rapidjson's allocator concept over the host heap.
 class HostJsonAllocator {
 public:
@@ -49,7 +53,7 @@ public:
     }
 };
 
-} // namespace
+} // namespace json_detail
 
 DataWriter::DataWriter(DataWriterResolveStringId* resolver)
     : m_resolver(resolver ? resolver : &defaultWriterResolver()) {}
@@ -101,10 +105,11 @@ void JSONWriteStream::write(const char* text, std::size_t bytes) {
 
 // ---- JSONAttrWriter -----------------------------------------------------------------
 
-struct JSONAttrWriter::Impl : rapidjson::PrettyWriter<JSONWriteStream, rapidjson::UTF8<>,
-                                                      rapidjson::UTF8<>, HostJsonAllocator> {
+struct JSONAttrWriter::Impl
+    : rapidjson::PrettyWriter<JSONWriteStream, rapidjson::UTF8<>, rapidjson::UTF8<>,
+                              json_detail::HostJsonAllocator> {
     using Base = rapidjson::PrettyWriter<JSONWriteStream, rapidjson::UTF8<>, rapidjson::UTF8<>,
-                                         HostJsonAllocator>;
+                                         json_detail::HostJsonAllocator>;
 
     struct Level {
         std::uint32_t count;
@@ -235,7 +240,7 @@ struct JSONAttrWriter::Impl : rapidjson::PrettyWriter<JSONWriteStream, rapidjson
         return afterValue();
     }
 
-    HostJsonAllocator allocator;
+    json_detail::HostJsonAllocator allocator;
     JSONWriteStream out;
     vector<Level> levels;
     std::uint64_t lineStart = 0;

@@ -819,6 +819,8 @@ TEST(JsonFactory, ReadingKeepsWhatWasReadBeforeAnError) {
          "json parser memory(1)| Error reading plugin!"},
         {"ForwardNameNeverDefined", "{\"node\": {\"ref^plugin\": \"nobody\"}}", 1,
          "json parser memory(1)| Unable to find plugin with name 'nobody'!"},
+        {"LinkToNameNeverDefined", "{\"node\": {\"l^link\": [0, \"nobody\", 1, \"x\"]}}", 1,
+         "json parser memory(1)| Unable to find plugin with name 'nobody'!"},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(row.name);
