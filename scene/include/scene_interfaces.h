@@ -190,23 +190,91 @@ public:
 };
 
 SCENE_PLAIN_INTERFACE(IPoints, IGeometry, points_schema)
-SCENE_PLAIN_INTERFACE(ILines, IGeometry, lines_schema)
-SCENE_PLAIN_INTERFACE(IHair, IGeometry, hair_schema)
+
+// Stored lines keep "linesStart" as differences while "indicesDeltaCompression"
+// is set; postLoad turns them back into start indices and clears the byte.
+class ILines : public IGeometry, public lines_schema {
+    SCENE_INTERFACE_MEMBERS(IGeometry)
+    void postLoad() override;
+};
+
+// The same for the "curvesStart" of hair.
+class IHair : public IGeometry, public hair_schema {
+    SCENE_INTERFACE_MEMBERS(IGeometry)
+    void postLoad() override;
+};
+
 SCENE_PLAIN_INTERFACE(IFur, IGeometry, fur_schema)
 SCENE_PLAIN_INTERFACE(ISubdividable, IGeometry, subdividable_schema)
-SCENE_PLAIN_INTERFACE(IMesh, ISubdividable, mesh_schema)
-SCENE_PLAIN_INTERFACE(ISkin, ISubdividable, skin_schema)
+
+// A polygon mesh. Index coding and decoding: scene_geometry.h.
+class IMesh : public ISubdividable, public mesh_schema {
+    SCENE_INTERFACE_MEMBERS(ISubdividable)
+
+    // Puts the faces of every primitive in a canonical order and rewrites
+    // "indices" as differences (see scene_geometry.h), then sets
+    // "indicesDeltaCompression" to 1. Answers whether it ran: a linked or
+    // mismatched index array, or indices that are already coded, leave the
+    // mesh unchanged and answer false.
+    bool deltaCompressIndices();
+    // Checks the vertex arrays, primitives and indices and reports every
+    // finding to the scene log; never changes the mesh. False only when a
+    // vertex array's count differs from the positions count.
+    bool validate() const;
+
+    // Modes 1 to 3 answer a stored "bounds" as it is. Otherwise the box of the
+    // positions the primitives select (each primitive's box kept in its
+    // "bounds"); modes 2 and 3 store the result in the mesh's "bounds".
+    void computeBounds(::base::box3d& result, std::uint32_t mode, bool recurse) override;
+};
+
+// Bounded by its "baseMesh"; a stored "bounds" is honoured like a mesh's.
+class ISkin : public ISubdividable, public skin_schema {
+    SCENE_INTERFACE_MEMBERS(ISubdividable)
+    void computeBounds(::base::box3d& result, std::uint32_t mode, bool recurse) override;
+};
+
 SCENE_PLAIN_INTERFACE(IMorph, ISubdividable, morph_schema)
 SCENE_PLAIN_INTERFACE(IInstancer, ::base::IPlugin, instancer_schema)
 SCENE_PLAIN_INTERFACE(IBuffer, ::base::IPlugin, buffer_schema)
 
-// Listens to the buffers it presents.
+// Presents the byte range [inputOffset, inputOffset + inputLength) of the
+// "data" of its "inputBuffer" through the outputs that exist on it
+// (outputUint8 ... outputFloat4); it creates none. The outputs hold copies of
+// the bytes, so they stay valid whatever happens to the buffer. Each run
+// listens to the buffer it read; a change the buffer reports (or one of the
+// adapter's inputs reported to pluginChanged) runs it again. Whoever sets the
+// inputs calls update().
 class IBufferAdapter : public ::base::IPlugin,
                        public ::base::PluginCallback,
                        public bufferAdapter_schema {
-    SCENE_INTERFACE_MEMBERS(::base::IPlugin)
+public:
+    IBufferAdapter(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
+                   std::uint32_t id);
+    ~IBufferAdapter() override;
+    using ::base::IPlugin::data;
+    using ::base::IPlugin::name;
+    using ::base::IPlugin::size;
+    using ::base::IPlugin::typeName;
+
+    // Refills every existing output from the current inputs and notifies the
+    // listeners once per output. Problems are logged; the outputs then keep
+    // what they held.
+    void update();
+
     void pluginChanged(::base::IPlugin& plugin, ::base::name_id attribute, std::uint32_t kind,
                        std::uint64_t identifier) override;
+    void postLoad() override { update(); }
+    // The copy presents the same range and listens to the same buffer.
+    ::base::Attribute* clone() const override;
+
+private:
+    void update(std::uint64_t stamp);
+    void watchBuffer(::base::IPlugin* buffer);
+
+    // The buffer listened to; nulled by the buffer's death.
+    ::base::WeakNode m_buffer;
+    std::uint64_t m_lastStamp = 0;
 };
 
 SCENE_PLAIN_INTERFACE(ISceneReference, ::base::IPlugin, sceneReference_schema)

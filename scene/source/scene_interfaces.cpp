@@ -1,7 +1,6 @@
 // What the scene classes do beyond holding attributes: interface attachment
 // and material inheritance. Bounds, transforms and change handling are
-// minimal here: nodes answer their stored bounds and the identity transform
-// until their hierarchy walk and transform composition are built.
+// minimal here; nodes compute theirs in scene_node.cpp.
 #include "scene_interfaces.h"
 #include "scene_getter.h"
 
@@ -21,46 +20,9 @@ base::name_id IHierarchical::interfaceName() {
     return name;
 }
 
-// ---- INode ----
-
-INode::INode(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory, std::uint32_t id)
-    : ::base::IPlugin(descriptor, factory, id) {
-    addInterface(static_cast<IBounded*>(this));
-    addInterface(static_cast<IHierarchical*>(this));
-}
-
-base::box3d INode::cachedBounds() const {
-    return get(*this, names::bounds, ::base::box3d::empty());
-}
-
-void INode::computeBounds(::base::box3d& result, std::uint32_t, bool) {
-    result = cachedBounds();
-}
-
-base::mat43 INode::localTransformation() const {
-    return ::base::mat43::identity();
-}
-
-// ---- IGeometry ----
-
-IGeometry::IGeometry(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
-                     std::uint32_t id)
-    : ::base::IPlugin(descriptor, factory, id) {
-    addInterface(static_cast<IBounded*>(this));
-}
-
-base::box3d IGeometry::cachedBounds() const {
-    return get(*this, names::bounds, ::base::box3d::empty());
-}
-
-void IGeometry::computeBounds(::base::box3d& result, std::uint32_t, bool) {
-    result = cachedBounds();
-}
+// INode lives in scene_node.cpp.
 
 // ---- Listeners ----
-
-void IBufferAdapter::pluginChanged(::base::IPlugin&, ::base::name_id, std::uint32_t,
-                                   std::uint64_t) {}
 
 void IAnimLayer::pluginChanged(::base::IPlugin&, ::base::name_id, std::uint32_t, std::uint64_t) {}
 

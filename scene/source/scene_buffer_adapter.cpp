@@ -1,0 +1,128 @@
+// The buffer adapter: typed outputs over a byte range of a buffer.
+//
+// The outputs are ordinary array attributes holding a copy of the range. The
+// base library's arrays always own their storage, and a copy cannot dangle
+// when the buffer reallocates its data or dies; each run replaces the whole
+// copy, so no output keeps bytes of an earlier run.
+#include "scene_getter.h"
+#include "scene_interfaces.h"
+
+#include "b_format.h"
+#include "b_log.h"
+#include "b_plugin_attribute.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace scene {
+
+namespace {
+
+using PluginRef = ::base::ref<::base::IPlugin>;
+
+// Refills the output 'name' when the adapter holds it as an array of T.
+template <class T>
+void present(IBufferAdapter& adapter, ::base::name_id name, const std::uint8_t* bytes,
+             std::size_t length, std::uint64_t stamp) {
+    ::base::Attribute* output = adapter.findEntry(name);
+    if (!output || output->typeName() != ::base::TypeTraits<T>::n_array_name)
+        return;
+    ::base::ArrayOf<T> items(length / sizeof(T));
+    if (!items.empty())
+        std::memcpy(static_cast<void*>(items.data()), bytes, items.size() * sizeof(T));
+    // Swapping gives back the old storage instead of keeping its capacity.
+    static_cast<::base::TypedVectorAttribute<T>*>(output)->items().swap(items);
+    adapter.notify(name, ::base::PluginCallback::changeKind, stamp);
+}
+
+bool isInput(::base::name_id attribute) {
+    return attribute.empty() || attribute == names::inputBuffer ||
+           attribute == names::inputOffset || attribute == names::inputLength;
+}
+
+} // namespace
+
+IBufferAdapter::IBufferAdapter(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
+                               std::uint32_t id)
+    : ::base::IPlugin(descriptor, factory, id) {}
+
+IBufferAdapter::~IBufferAdapter() {
+    if (auto* watched = static_cast<::base::RefCntAtomic*>(m_buffer.watched))
+        watched->removeWeak(m_buffer);
+}
+
+void IBufferAdapter::watchBuffer(::base::IPlugin* buffer) {
+    auto* watched = static_cast<::base::RefCntAtomic*>(m_buffer.watched);
+    ::base::IPlugin* current = watched ? static_cast<::base::IPlugin*>(watched) : nullptr;
+    if (current == buffer)
+        return;
+    if (current) {
+        current->removeListener(*this);
+        current->removeWeak(m_buffer);
+    }
+    if (buffer) {
+        buffer->addListener(*this);
+        buffer->addWeak(m_buffer);
+    }
+}
+
+void IBufferAdapter::update() {
+    update(::base::PluginCallback::nextChangeStamp());
+}
+
+void IBufferAdapter::update(std::uint64_t stamp) {
+    m_lastStamp = stamp;
+    const PluginRef* input = findAttribute<PluginRef>(names::inputBuffer);
+    if (!input || !*input) {
+        watchBuffer(nullptr);
+        ::base::logFormatted(::base::logScene, ::base::logWarning,
+                             "bufferAdapter |{}| Missing `inputBuffer` attribute!", name());
+        return;
+    }
+    ::base::IPlugin& buffer = **input;
+    watchBuffer(&buffer);
+    const auto* data = buffer.findVecAttribute<std::uint8_t>(names::data);
+    if (!data) {
+        ::base::logFormatted(::base::logScene, ::base::logWarning,
+                             "bufferAdapter |{}| Missing `data` attribute in {}!", name(),
+                             buffer.name());
+        return;
+    }
+
+    const std::size_t size = data->size();
+    const std::size_t offset = std::min<std::size_t>(get(*this, names::inputOffset, 0u), size);
+    const std::size_t length =
+        std::min<std::size_t>(get(*this, names::inputLength, 0xFFFFFFFFu), size - offset);
+    const std::uint8_t* bytes = data->data() + offset;
+
+    present<std::uint8_t>(*this, names::outputUint8, bytes, length, stamp);
+    present<std::uint16_t>(*this, names::outputUint16, bytes, length, stamp);
+    present<std::uint32_t>(*this, names::outputUint32, bytes, length, stamp);
+    present<float>(*this, names::outputFloat, bytes, length, stamp);
+    present<::base::vec2f>(*this, names::outputFloat2, bytes, length, stamp);
+    present<::base::vec3f>(*this, names::outputFloat3, bytes, length, stamp);
+    present<::base::vec4f>(*this, names::outputFloat4, bytes, length, stamp);
+}
+
+void IBufferAdapter::pluginChanged(::base::IPlugin& plugin, ::base::name_id attribute,
+                                   std::uint32_t kind, std::uint64_t identifier) {
+    const bool change = kind == ::base::PluginCallback::changeKind;
+    // The same change may arrive along two ways; run once for it.
+    if (change && identifier == m_lastStamp)
+        return;
+    // Of its own attributes only the inputs matter; the outputs are its own
+    // work.
+    if (&plugin == this && !isInput(attribute))
+        return;
+    update(change && identifier ? identifier : ::base::PluginCallback::nextChangeStamp());
+}
+
+base::Attribute* IBufferAdapter::clone() const {
+    ::base::Attribute* copy = ::base::IPlugin::clone();
+    // A copy must listen to the buffer as well.
+    if (auto* adapter = dynamic_cast<IBufferAdapter*>(copy))
+        adapter->update();
+    return copy;
+}
+
+} // namespace scene

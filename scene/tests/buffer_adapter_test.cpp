@@ -1,0 +1,174 @@
+// Buffer adapters: clamped ranges, typed outputs, messages and re-runs on the
+// buffer's change notifications.
+#include "scene_getter.h"
+#include "scene_interfaces.h"
+
+#include "b_log.h"
+#include "b_plugin_attribute.h"
+
+#include <gtest/gtest.h>
+
+#include <numeric>
+#include <string>
+#include <vector>
+
+namespace {
+
+using namespace scene;
+using base::ref, base::IPlugin, base::PluginFactory, base::name_id;
+
+// Counts the notifications an adapter sends, by attribute.
+struct Recorder : base::PluginCallback {
+    std::vector<std::pair<name_id, std::uint64_t>> seen;
+    void pluginChanged(IPlugin&, name_id attribute, std::uint32_t, std::uint64_t id) override {
+        seen.emplace_back(attribute, id);
+    }
+};
+
+struct Adapter : ::testing::Test {
+    base::CaptureLog log;
+    base::ScopedLog scoped{log};
+    ref<PluginFactory> factory{new PluginFactory("test")};
+    ref<IPlugin> buffer;
+    ref<IBufferAdapter> adapter;
+
+    Adapter() {
+        register_scene_schema(*factory);
+        buffer = factory->create("buffer", PluginFactory::createNullIfUnknown);
+        buffer->setAttribute(names::name, base::string("buf"));
+        auto& bytes = buffer->vecAttribute<std::uint8_t>(names::data)->items();
+        bytes.resize(10);
+        std::iota(bytes.begin(), bytes.end(), std::uint8_t(0));
+        ref<IPlugin> made = factory->create("bufferAdapter", PluginFactory::createNullIfUnknown);
+        adapter = ref<IBufferAdapter>(dynamic_cast<IBufferAdapter*>(made.get()));
+        adapter->setAttribute(names::name, base::string("ad"));
+        for (name_id output : outputs())
+            adapter->attributeOfType(output, arrayType(output));
+    }
+
+    static std::vector<name_id> outputs() {
+        return {names::outputUint8,  names::outputUint16, names::outputUint32, names::outputFloat,
+                names::outputFloat2, names::outputFloat3, names::outputFloat4};
+    }
+    static name_id arrayType(name_id output) {
+        using base::TypeTraits;
+        if (output == names::outputUint8)
+            return TypeTraits<std::uint8_t>::n_array_name;
+        if (output == names::outputUint16)
+            return TypeTraits<std::uint16_t>::n_array_name;
+        if (output == names::outputUint32)
+            return TypeTraits<std::uint32_t>::n_array_name;
+        if (output == names::outputFloat)
+            return TypeTraits<float>::n_array_name;
+        if (output == names::outputFloat2)
+            return TypeTraits<base::vec2f>::n_array_name;
+        if (output == names::outputFloat3)
+            return TypeTraits<base::vec3f>::n_array_name;
+        return TypeTraits<base::vec4f>::n_array_name;
+    }
+    std::vector<std::uint32_t> counts() const {
+        std::vector<std::uint32_t> out;
+        for (name_id output : outputs())
+            out.push_back(adapter->findEntry(output)->size());
+        return out;
+    }
+    const base::ArrayOf<std::uint8_t>& bytesOut() const {
+        return *adapter->findVecAttribute<std::uint8_t>(names::outputUint8);
+    }
+};
+
+struct ClampCase {
+    const char* name;
+    std::uint32_t offset;
+    std::uint32_t length; // 0: not set
+    std::vector<std::uint32_t> counts;
+    std::uint8_t first;
+};
+
+class Clamping : public Adapter, public ::testing::WithParamInterface<ClampCase> {};
+
+TEST_P(Clamping, OutputsCoverTheClampedRange) {
+    const ClampCase& c = GetParam();
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->setAttribute(names::inputOffset, c.offset);
+    if (c.length)
+        adapter->setAttribute(names::inputLength, c.length);
+    adapter->update();
+    EXPECT_TRUE(log.messages().empty());
+    EXPECT_EQ(counts(), c.counts);
+    if (!bytesOut().empty()) {
+        EXPECT_EQ(bytesOut()[0], c.first);
+    }
+}
+INSTANTIATE_TEST_SUITE_P(
+    Adapter, Clamping,
+    ::testing::Values(ClampCase{"whole", 0, 0, {10, 5, 2, 2, 1, 0, 0}, 0},
+                      ClampCase{"tailPastEnd", 4, 100, {6, 3, 1, 1, 0, 0, 0}, 4},
+                      ClampCase{"offsetPastEnd", 20, 0, {0, 0, 0, 0, 0, 0, 0}, 0},
+                      ClampCase{"window", 1, 8, {8, 4, 2, 2, 1, 0, 0}, 1}),
+    [](const auto& info) { return std::string(info.param.name); });
+
+TEST_F(Adapter, MissingInputsLogOnceAndKeepTheOutputs) {
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->update();
+    const std::vector<std::uint32_t> before = counts();
+
+    adapter->removeAttribute(names::inputBuffer);
+    log.clear();
+    adapter->update();
+    EXPECT_EQ(log.messages(),
+              (base::vector<base::string>{"bufferAdapter |ad| Missing `inputBuffer` attribute!"}));
+    EXPECT_EQ(counts(), before);
+
+    adapter->setAttribute(names::inputBuffer, buffer);
+    buffer->removeAttribute(names::data);
+    log.clear();
+    adapter->update();
+    EXPECT_EQ(log.messages(),
+              (base::vector<base::string>{"bufferAdapter |ad| Missing `data` attribute in buf!"}));
+    EXPECT_EQ(counts(), before);
+}
+
+TEST_F(Adapter, BufferChangesRunTheAdapterOncePerStamp) {
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->update();
+    Recorder recorder;
+    adapter->addListener(recorder);
+
+    auto& bytes = buffer->vecAttribute<std::uint8_t>(names::data)->items();
+    bytes.assign(16, 0xAB); // reallocates: the outputs must not point at the old block
+    const std::uint64_t stamp = base::PluginCallback::nextChangeStamp();
+    buffer->notify(names::data, base::PluginCallback::changeKind, stamp);
+    ASSERT_EQ(bytesOut().size(), 16u);
+    EXPECT_EQ(bytesOut()[15], 0xAB);
+    // One notification per output, carrying the buffer's stamp on.
+    ASSERT_EQ(recorder.seen.size(), outputs().size());
+    EXPECT_EQ(recorder.seen[0], std::make_pair(names::outputUint8, stamp));
+
+    // The same change arriving a second way is not run again.
+    bytes.resize(3);
+    buffer->notify(names::data, base::PluginCallback::changeKind, stamp);
+    EXPECT_EQ(bytesOut().size(), 16u);
+    buffer->notify(names::data, base::PluginCallback::changeKind,
+                   base::PluginCallback::nextChangeStamp());
+    EXPECT_EQ(bytesOut().size(), 3u);
+}
+
+TEST_F(Adapter, AnotherBufferReplacesTheOldOneSafely) {
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->update();
+    ref<IPlugin> other = factory->create("buffer", PluginFactory::createUnregistered);
+    other->vecAttribute<std::uint8_t>(names::data)->items() = {1, 2};
+    adapter->setAttribute(names::inputBuffer, other);
+    adapter->update();
+    EXPECT_FALSE(buffer->hasListener(*adapter));
+    EXPECT_TRUE(other->hasListener(*adapter));
+    EXPECT_EQ(bytesOut().size(), 2u);
+
+    // The outputs own their bytes: the buffer's death leaves them readable.
+    adapter->removeAttribute(names::inputBuffer);
+    other.reset();
+    EXPECT_EQ(bytesOut()[1], 2);
+}
+
+} // namespace
