@@ -1,0 +1,262 @@
+#include "as_importer.h"
+
+#include "as_io.h"
+#include "as_logger.h"
+#include "b_exception.h"
+#include "b_format.h"
+#include "b_log.h"
+#include "b_plugin_attribute.h"
+#include "scene_schema.h"
+
+#include <assimp/DefaultLogger.hpp>
+#include <assimp/Importer.hpp>
+#include <assimp/config.h>
+#include <assimp/postprocess.h>
+#include <assimp/scene.h>
+
+#include <cctype>
+#include <string_view>
+
+namespace as {
+
+namespace {
+
+// Options only this importer reads; the host sets them when it wants them.
+base::name_id flipTextureCoordinatesName() {
+    static const base::name_id name("importFlipTextureCoordinates");
+    return name;
+}
+base::name_id flipFaceWindingName() {
+    static const base::name_id name("importFlipFaceWinding");
+    return name;
+}
+
+// An option counts only when present with the expected type.
+template <class T>
+bool optionIs(const base::AttribMap& options, base::name_id name, const T& value) {
+    const T* found = options.findAttribute<T>(name);
+    return found && *found == value;
+}
+
+// Removes the assimp logger on every way out of an import, so no logger
+// outlives the import that installed it.
+struct InstalledLogger {
+    InstalledLogger() { Assimp::DefaultLogger::set(new AssimpLogger()); }
+    ~InstalledLogger() { Assimp::DefaultLogger::kill(); }
+    InstalledLogger(const InstalledLogger&) = delete;
+    InstalledLogger& operator=(const InstalledLogger&) = delete;
+};
+
+void logFatal(const base::string& path) noexcept {
+    try {
+        base::logFormatted(base::logScene, base::logCritical,
+                           "assimp import |{}| Fatal error during the scene loading!", path);
+    } catch (...) {
+    }
+}
+
+} // namespace
+
+bool ImportFlags::removesComponents() const noexcept {
+    return (flags & aiProcess_RemoveComponent) != 0;
+}
+
+ImportFlags importFlags(const base::AttribMap& options) {
+    using S = scene::sceneImporter_schema;
+    ImportFlags out;
+    out.flags = aiProcess_JoinIdenticalVertices | aiProcess_FindInstances;
+    auto remove = [&out](std::uint32_t component) {
+        out.flags |= aiProcess_RemoveComponent;
+        out.components |= component;
+    };
+
+    if (optionIs(options, S::importMeshes(), false))
+        remove(aiComponent_MESHES);
+    if (optionIs(options, flipTextureCoordinatesName(), true))
+        out.flags |= aiProcess_FlipUVs;
+    if (optionIs(options, flipFaceWindingName(), true))
+        out.flags |= aiProcess_FlipWindingOrder;
+    if (optionIs(options, S::importTriangulateMeshes(), true))
+        out.flags |= aiProcess_Triangulate;
+    if (const std::uint8_t* normals = options.findAttribute<std::uint8_t>(S::importNormals())) {
+        if (*normals == 0)
+            remove(aiComponent_NORMALS);
+        else if (*normals == 2)
+            out.flags |= aiProcess_GenSmoothNormals;
+    }
+    if (const std::uint8_t* tangents = options.findAttribute<std::uint8_t>(S::importTangents())) {
+        if (*tangents == 0)
+            remove(aiComponent_TANGENTS_AND_BITANGENTS);
+        else if (*tangents == 2)
+            out.flags |= aiProcess_CalcTangentSpace;
+    }
+    if (optionIs(options, S::importTextureCoordinates(), false))
+        remove(aiComponent_TEXCOORDS);
+    if (optionIs(options, S::importColors(), false))
+        remove(aiComponent_COLORS);
+    if (optionIs(options, S::importLights(), false))
+        remove(aiComponent_LIGHTS);
+    if (optionIs(options, S::importSkeletons(), false))
+        remove(aiComponent_BONEWEIGHTS);
+    if (optionIs(options, S::importMaterials(), false))
+        remove(aiComponent_MATERIALS);
+    if (optionIs(options, S::importCameras(), false))
+        remove(aiComponent_CAMERAS);
+    if (optionIs(options, S::importAnimations(), false))
+        remove(aiComponent_ANIMATIONS);
+    return out;
+}
+
+const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
+                         const base::string& path) {
+    const ImportFlags flags = importFlags(options);
+    if (flags.removesComponents())
+        importer.SetPropertyInteger(AI_CONFIG_PP_RVC_FLAGS, int(flags.components));
+    return importer.ReadFile(path.c_str(), flags.flags);
+}
+
+std::uint8_t upAxisForPath(const base::string& path) {
+    std::string_view file(path);
+    if (const auto slash = file.find_last_of("/\\"); slash != std::string_view::npos)
+        file.remove_prefix(slash + 1);
+    const auto dot = file.rfind('.');
+    if (dot == std::string_view::npos)
+        return 1;
+    const std::string_view extension = file.substr(dot + 1);
+    constexpr std::string_view blend = "blend";
+    if (extension.size() != blend.size())
+        return 1;
+    for (std::size_t i = 0; i < blend.size(); ++i)
+        if (std::tolower(static_cast<unsigned char>(extension[i])) != blend[i])
+            return 1;
+    return 2;
+}
+
+base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginFactory& factory) {
+    base::map<base::string, base::ref<scene::INode>> nodes;
+    const std::uint32_t count = factory.pluginCount();
+    for (std::uint32_t id = 0; id < count; ++id) {
+        base::ref<base::IPlugin> object = factory.plugin(id);
+        if (!object || object->className() != scene::node_schema::type())
+            continue;
+        auto* node = dynamic_cast<scene::INode*>(object.get());
+        if (!node)
+            continue;
+        if (const base::string* name =
+                node->findAttribute<base::string>(scene::node_schema::name()))
+            nodes.emplace(*name, base::ref<scene::INode>(node));
+    }
+    return nodes;
+}
+
+// ---- AssimpImporter ---------------------------------------------------------------
+
+AssimpImporter::AssimpImporter(base::IPluginDesc* descriptor, base::PluginFactory* factory,
+                               std::uint32_t id)
+    : scene::SceneImportPlugin(descriptor, factory, id) {}
+
+AssimpImporter::~AssimpImporter() = default;
+
+void AssimpImporter::describeOptions(base::AttribMap& options) {
+    using S = scene::sceneImporter_schema;
+    // Called by the host: a failure of the attribute core is logged here.
+    try {
+        options.setAttribute(S::importMeshes(), S::importMeshesDefault());
+        options.setAttribute(S::importTriangulateMeshes(), S::importTriangulateMeshesDefault());
+        options.setAttribute(S::importColors(), S::importColorsDefault());
+        options.setAttribute(S::importTextureCoordinates(), S::importTextureCoordinatesDefault());
+        options.setAttribute(S::importNormals(), S::importNormalsDefault());
+        options.setAttribute(S::importTangents(), S::importTangentsDefault());
+        options.setAttribute(S::importSkeletons(), S::importSkeletonsDefault());
+        options.setAttribute(S::importLights(), S::importLightsDefault());
+        options.setAttribute(S::importMaterials(), S::importMaterialsDefault());
+        options.setAttribute(S::importCameras(), S::importCamerasDefault());
+        options.setAttribute(S::importHair(), S::importHairDefault());
+        options.setAttribute(S::importAnimations(), S::importAnimationsDefault());
+        options.setClassName(S::type());
+    } catch (const base::exception& e) {
+        e.log(base::log());
+    } catch (...) {
+        base::logFormatted(base::logScene, base::logError,
+                           "assimp import {}| Unable to describe the options!", name(true));
+    }
+}
+
+bool AssimpImporter::import(base::PluginFactory& factory, const base::string& path) {
+    // Nothing may unwind into the host: every failure ends here with the
+    // fatal line.
+    try {
+        Assimp::Importer importer;
+        importer.SetIOHandler(new AssimpIO());
+        InstalledLogger logger;
+
+        const aiScene* source = nullptr;
+        try {
+            source = readScene(importer, *this, path);
+        } catch (...) {
+            // Nothing was read (assimp gave up, for instance out of memory):
+            // a failure, not an empty success.
+            logFatal(path);
+            return false;
+        }
+        if (!source || !source->mRootNode)
+            return false;
+
+        m_factory = &factory;
+        try {
+            convert(source, path);
+        } catch (...) {
+            logFatal(path);
+        }
+        m_nodeMemo.clear();
+        importer.FreeScene();
+        return true;
+    } catch (...) {
+        m_nodeMemo.clear();
+        logFatal(path);
+        return false;
+    }
+}
+
+void AssimpImporter::convert(const aiScene* source, const base::string& path) {
+    using base::IPlugin;
+    constexpr std::uint32_t createFlags =
+        base::PluginFactory::createNullIfUnknown | base::PluginFactory::createReportUnknown;
+
+    // Cleared rather than only resized: a mesh must never pick up a material
+    // left by an earlier import, possibly made in another factory.
+    m_materials.assign(source->mNumMaterials, {});
+    m_meshSlots.assign(source->mNumMeshes, {});
+    m_arrayPool.clear();
+    m_nodeMemo.clear();
+    TextureList embeddedTextures(source->mNumTextures);
+
+    // Materials are converted here, by source index into m_materials, before
+    // the nodes: the meshes read them.
+
+    base::ref<scene::INode> root = importNode(source, source->mRootNode, embeddedTextures);
+    if (root) {
+        root->setAttribute(scene::node_schema::isLayer(), true);
+        if (scene::IBounded* bounded = scene::query<scene::IBounded>(*root)) {
+            base::box3d bounds;
+            bounded->computeBounds(bounds, 3, true);
+        }
+    }
+
+    base::ref<IPlugin> sceneObject = m_factory->create(scene::scene_schema::type(), createFlags);
+    if (sceneObject) {
+        sceneObject->setAttribute(scene::scene_schema::name(), m_factory->uniqueName("scene"));
+        sceneObject->setAttribute(scene::scene_schema::root(), base::ref<IPlugin>(root.get()));
+        sceneObject->setAttribute(scene::scene_schema::upAxis(), upAxisForPath(path));
+        sceneObject->setAttribute(scene::scene_schema::time(), base::TimeCode());
+    }
+
+    const NodeMap nodes = nodesByName(*m_factory);
+    resolveJoints(source, nodes);
+    // The animation conversion follows with the same map.
+
+    // The light conversion, then the camera conversion, come here, each in
+    // source order.
+}
+
+} // namespace as

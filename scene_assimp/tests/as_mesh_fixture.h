@@ -1,0 +1,204 @@
+// Shared set-up of the mesh and skin conversion tests: a factory with the scene
+// types, an importer object, and hand-built assimp meshes.
+#pragma once
+
+#include "as_importer.h"
+#include "b_log.h"
+#include "b_plugin_attribute.h"
+#include "b_plugin_factory.h"
+#include "scene_getter.h"
+#include "scene_interfaces.h"
+#include "scene_schema.h"
+
+#include <assimp/mesh.h>
+#include <assimp/scene.h>
+#include <gtest/gtest.h>
+
+#include <initializer_list>
+#include <vector>
+
+namespace as {
+
+// Reaches the private conversion steps of the importer. The member names carry
+// a "mesh" prefix so they cannot collide with other tests' use of this struct.
+struct ImporterTestAccess {
+    using MeshNodeMap = AssimpImporter::NodeMap;
+
+    static void meshBeginImport(AssimpImporter& importer, base::PluginFactory& factory,
+                                const aiScene& scene) {
+        importer.m_factory = &factory;
+        importer.m_meshSlots.assign(scene.mNumMeshes, {});
+        importer.m_arrayPool.clear();
+        importer.m_nodeMemo.clear();
+    }
+    static base::ref<scene::INode> meshImportNode(AssimpImporter& importer, const aiScene& scene,
+                                                  const aiNode& node) {
+        AssimpImporter::TextureList textures;
+        return importer.importNode(&scene, &node, textures);
+    }
+    static base::ref<scene::IGeometry> meshImport(AssimpImporter& importer, const aiScene& scene,
+                                                  std::uint32_t index) {
+        AssimpImporter::TextureList textures;
+        return importer.importMesh(&scene, scene.mMeshes[index], textures);
+    }
+    static void meshResolveJoints(AssimpImporter& importer, const aiScene& scene,
+                                  const AssimpImporter::NodeMap& nodes) {
+        importer.resolveJoints(&scene, nodes);
+    }
+    static base::vector<base::ref<scene::IMaterial>>& meshMaterials(AssimpImporter& importer) {
+        return importer.m_materials;
+    }
+    static SharedArrayPool& meshPool(AssimpImporter& importer) { return importer.m_arrayPool; }
+};
+
+namespace meshtest {
+
+namespace names = scene::names;
+
+struct Vec {
+    float x, y, z;
+};
+
+// A source mesh with the given positions and faces (each face a list of indices).
+inline aiMesh* makeMesh(const char* name, std::initializer_list<Vec> positions,
+                        std::initializer_list<std::initializer_list<unsigned>> faces) {
+    auto* mesh = new aiMesh;
+    mesh->mName = aiString(name);
+    mesh->mNumVertices = unsigned(positions.size());
+    if (positions.size()) {
+        mesh->mVertices = new aiVector3D[positions.size()];
+        unsigned i = 0;
+        for (const Vec& p : positions)
+            mesh->mVertices[i++] = aiVector3D(p.x, p.y, p.z);
+    }
+    if (faces.size()) {
+        mesh->mNumFaces = unsigned(faces.size());
+        mesh->mFaces = new aiFace[faces.size()];
+        unsigned f = 0;
+        for (const auto& face : faces) {
+            mesh->mFaces[f].mNumIndices = unsigned(face.size());
+            mesh->mFaces[f].mIndices = new unsigned[face.size()];
+            unsigned i = 0;
+            for (unsigned index : face)
+                mesh->mFaces[f].mIndices[i++] = index;
+            ++f;
+        }
+    }
+    return mesh;
+}
+
+// n vertices on the x axis, no faces.
+inline aiMesh* makeLine(const char* name, unsigned n) {
+    auto* mesh = new aiMesh;
+    mesh->mName = aiString(name);
+    mesh->mNumVertices = n;
+    mesh->mVertices = new aiVector3D[n];
+    for (unsigned i = 0; i < n; ++i)
+        mesh->mVertices[i] = aiVector3D(float(i), 0, 0);
+    return mesh;
+}
+
+inline aiBone* addBone(aiMesh& mesh, const char* name,
+                       std::initializer_list<std::pair<unsigned, float>> weights) {
+    auto* bone = new aiBone;
+    bone->mName = aiString(name);
+    bone->mNumWeights = unsigned(weights.size());
+    bone->mWeights = new aiVertexWeight[weights.size() ? weights.size() : 1];
+    unsigned i = 0;
+    for (const auto& [vertex, weight] : weights)
+        bone->mWeights[i++] = aiVertexWeight(vertex, weight);
+    auto** bones = new aiBone*[mesh.mNumBones + 1];
+    for (unsigned b = 0; b < mesh.mNumBones; ++b)
+        bones[b] = mesh.mBones[b];
+    bones[mesh.mNumBones] = bone;
+    delete[] mesh.mBones;
+    mesh.mBones = bones;
+    ++mesh.mNumBones;
+    return bone;
+}
+
+// The meshes in a scene that owns them.
+inline aiScene* makeScene(std::initializer_list<aiMesh*> meshes) {
+    auto* scene = new aiScene;
+    scene->mNumMeshes = unsigned(meshes.size());
+    scene->mMeshes = new aiMesh*[meshes.size()];
+    unsigned i = 0;
+    for (aiMesh* mesh : meshes)
+        scene->mMeshes[i++] = mesh;
+    return scene;
+}
+
+template <class T>
+std::vector<T> items(const base::AttribMap& map, base::name_id name) {
+    const base::Attribute* found = map.findEntry(name);
+    if (!found || found->typeName() != base::TypeTraits<T>::n_array_name)
+        return {};
+    const auto* values = static_cast<const base::ArrayOf<T>*>(
+        const_cast<base::Attribute*>(found)->data(base::wholeValue));
+    return std::vector<T>(values->begin(), values->end());
+}
+
+inline const base::AttribMap* item(const base::AttribMap& map, base::name_id name,
+                                   std::uint32_t index) {
+    const base::Attribute* found = map.findEntry(name);
+    if (!found)
+        return nullptr;
+    auto* array = const_cast<base::Attribute*>(found)->asArray();
+    if (!array || !array->item(index))
+        return nullptr;
+    return array->item(index)->asMap();
+}
+
+// A factory with the scene types, an importer bound to it, and a captured log.
+class MeshTest : public ::testing::Test {
+protected:
+    MeshTest() {
+        scene::register_scene_schema(*factory);
+        importer =
+            base::ref<AssimpImporter>(new AssimpImporter(nullptr, nullptr, base::invalidPluginId));
+    }
+    ~MeshTest() override {
+        if (source)
+            delete source;
+    }
+
+    // Takes 'scene' and starts an import of it.
+    void begin(aiScene* scene) {
+        delete source;
+        source = scene;
+        ImporterTestAccess::meshBeginImport(*importer, *factory, *source);
+    }
+    base::ref<scene::IGeometry> convert(std::uint32_t index) {
+        return ImporterTestAccess::meshImport(*importer, *source, index);
+    }
+
+public:
+    // The mesh behind an answer (the answer itself, or a skin's base mesh).
+    static base::IPlugin* meshOf(const base::ref<scene::IGeometry>& answer) {
+        if (!answer)
+            return nullptr;
+        if (auto* skin = dynamic_cast<scene::ISkin*>(answer.get())) {
+            const auto* base = skin->findAttribute<base::ref<base::IPlugin>>(names::baseMesh);
+            return base ? base->get() : nullptr;
+        }
+        return answer.get();
+    }
+
+protected:
+    std::uint32_t countOfType(base::name_id type) const {
+        std::uint32_t n = 0;
+        for (std::uint32_t i = 0; i < factory->pluginCount(); ++i)
+            if (auto p = factory->plugin(i); p && p->className() == type)
+                ++n;
+        return n;
+    }
+
+    base::CaptureLog captured;
+    base::ScopedLog scopedLog{captured};
+    base::ref<base::PluginFactory> factory{new base::PluginFactory("test")};
+    base::ref<AssimpImporter> importer;
+    aiScene* source = nullptr;
+};
+
+} // namespace meshtest
+} // namespace as
