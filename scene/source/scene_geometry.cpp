@@ -208,9 +208,17 @@ void sortFaces(::base::vector<Face>& faces, const Indices& c0) {
         std::size_t j = i + 1;
         while (j < sorted.size() && c0[sorted[j].at] == c0[sorted[i].at])
             ++j;
-        if (j - i > 1)
-            std::stable_sort(sorted.begin() + std::ptrdiff_t(i), sorted.begin() + std::ptrdiff_t(j),
-                             less);
+        const auto first = sorted.begin() + std::ptrdiff_t(i);
+        const auto last = sorted.begin() + std::ptrdiff_t(j);
+        if (j - i > 32) {
+            std::stable_sort(first, last, less);
+        } else {
+            // Runs are a handful of faces around one vertex: an insertion
+            // sort, stable and without the merge buffer of a general sort.
+            for (auto k = first + 1; k < last; ++k)
+                for (auto m = k; m > first && less(*m, *(m - 1)); --m)
+                    std::iter_swap(m, m - 1);
+        }
         i = j;
     }
     faces.swap(sorted);
