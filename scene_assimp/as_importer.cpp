@@ -142,9 +142,12 @@ base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginF
         auto* node = dynamic_cast<scene::INode*>(object.get());
         if (!node)
             continue;
-        if (const base::string* name =
-                node->findAttribute<base::string>(scene::node_schema::name()))
-            nodes.emplace(*name, base::ref<scene::INode>(node));
+        // A "name" of another type is skipped, not reported: the map takes
+        // what it can use.
+        const base::Attribute* name = node->findEntry(scene::node_schema::name());
+        if (name && name->typeName() == base::TypeTraits<base::string>::n_name)
+            nodes.emplace(*static_cast<const base::string*>(name->data()),
+                          base::ref<scene::INode>(node));
     }
     return nodes;
 }
@@ -202,20 +205,42 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
         if (!source || !source->mRootNode)
             return false;
 
-        m_factory = &factory;
         try {
+            beginImport(factory, source);
             convert(source, path);
         } catch (...) {
             logFatal(path);
         }
-        m_nodeMemo.clear();
+        releaseImportState();
         importer.FreeScene();
         return true;
     } catch (...) {
-        m_nodeMemo.clear();
+        releaseImportState();
         logFatal(path);
         return false;
     }
+}
+
+void AssimpImporter::releaseImportState() noexcept {
+    // The slots and the pool refer to this import's objects: holding them
+    // past it would keep a dropped factory's meshes alive.
+    m_nodeMemo.clear();
+    m_meshIndex.clear();
+    m_meshSlots.clear();
+    m_arrayPool.clear();
+}
+
+void AssimpImporter::beginImport(base::PluginFactory& factory, const aiScene* source) {
+    m_factory = &factory;
+    // Cleared rather than only resized: a mesh must never pick up a material
+    // left by an earlier import, possibly made in another factory.
+    m_materials.assign(source->mNumMaterials, {});
+    m_meshSlots.assign(source->mNumMeshes, {});
+    m_meshIndex.clear();
+    for (std::uint32_t i = 0; source->mMeshes && i < source->mNumMeshes; ++i)
+        m_meshIndex.emplace(source->mMeshes[i], i);
+    m_arrayPool.clear();
+    m_nodeMemo.clear();
 }
 
 void AssimpImporter::convert(const aiScene* source, const base::string& path) {
@@ -223,12 +248,6 @@ void AssimpImporter::convert(const aiScene* source, const base::string& path) {
     constexpr std::uint32_t createFlags =
         base::PluginFactory::createNullIfUnknown | base::PluginFactory::createReportUnknown;
 
-    // Cleared rather than only resized: a mesh must never pick up a material
-    // left by an earlier import, possibly made in another factory.
-    m_materials.assign(source->mNumMaterials, {});
-    m_meshSlots.assign(source->mNumMeshes, {});
-    m_arrayPool.clear();
-    m_nodeMemo.clear();
     TextureList embeddedTextures(source->mNumTextures);
 
     // Materials are converted here, by source index into m_materials, before

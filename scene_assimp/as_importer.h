@@ -79,14 +79,21 @@ private:
     // Binds the joints of every skin to the nodes of the scene (as_skin.cpp).
     void resolveJoints(const aiScene* scene, const NodeMap& nodesByName);
 
-    // Steps 5 to 15 of an import, after assimp has read the file.
+    // Points the per-import state (factory, material list, mesh slots, pool,
+    // node memo) at a new import of 'scene' into 'factory'.
+    void beginImport(base::PluginFactory& factory, const aiScene* scene);
+    // Steps 6 to 15 of an import, after assimp has read the file.
     void convert(const aiScene* scene, const base::string& path);
+    // Forgets what refers to the objects of the import that just ended.
+    void releaseImportState() noexcept;
 
     base::PluginFactory* m_factory = nullptr;
     // By source material index (empty until materials are converted).
     base::vector<base::ref<scene::IMaterial>> m_materials;
     // The converted object per source mesh; the driver sizes it at the start of each import.
     base::vector<base::ref<scene::IGeometry>> m_meshSlots;
+    // The position of each source mesh in the scene's list, for its slot.
+    base::map<const aiMesh*, std::uint32_t> m_meshIndex;
     SharedArrayPool m_arrayPool;
     // The node made for each source node during the running import; a node
     // reached twice yields the same object. Uncounted: the factory holds them.

@@ -12,12 +12,11 @@ namespace as {
 
 namespace {
 
-// The byte count of size × count elements, saturated instead of wrapping.
-std::uint64_t byteCount(size_t size, size_t count) noexcept {
-    std::uint64_t bytes;
-    if (__builtin_mul_overflow(std::uint64_t(size), std::uint64_t(count), &bytes))
-        return std::numeric_limits<std::uint64_t>::max();
-    return bytes;
+// The byte count of size × count elements, in 64 bits so that large requests
+// are not cut short. False when it overflows: no buffer can be that big, so
+// such a request is refused rather than served into memory it does not have.
+bool byteCount(size_t size, size_t count, std::uint64_t& bytes) noexcept {
+    return !__builtin_mul_overflow(std::uint64_t(size), std::uint64_t(count), &bytes);
 }
 
 void logUnexpected(const char* operation, const char* name, const std::exception& e) noexcept {
@@ -77,9 +76,9 @@ void AssimpIO::Close(Assimp::IOStream* stream) {
 
 size_t AssimpStream::Read(void* buffer, size_t size, size_t count) {
     try {
-        if (size == 0)
+        std::uint64_t asked = 0;
+        if (size == 0 || !byteCount(size, count, asked))
             return 0;
-        const std::uint64_t asked = byteCount(size, count);
         const std::uint64_t read = m_stream.read(buffer, asked);
         if (m_stream.strictRead() && read < asked) {
             base::exception e(base::format("stream '{}': trying to read {} bytes, read {} bytes",
@@ -99,9 +98,9 @@ size_t AssimpStream::Read(void* buffer, size_t size, size_t count) {
 
 size_t AssimpStream::Write(const void* buffer, size_t size, size_t count) {
     try {
-        if (size == 0)
+        std::uint64_t asked = 0;
+        if (size == 0 || !byteCount(size, count, asked))
             return 0;
-        const std::uint64_t asked = byteCount(size, count);
         const std::uint64_t written = m_stream.write(buffer, asked);
         if (m_stream.strictWrite() && written < asked) {
             // Thrown through assimp this would unwind code that does not

@@ -27,24 +27,6 @@ static_assert(sizeof(aiVector3D) == sizeof(base::vec3f), "positions are copied a
 static_assert(sizeof(aiVector3D) == sizeof(base::normal), "normals are copied as blocks");
 static_assert(sizeof(aiColor4D) == 4 * sizeof(float));
 
-// The slot of 'mesh' in the scene's mesh list, or wholeValue when it is not
-// there. Nodes mostly reach meshes in list order, so the search starts after
-// the previous answer.
-std::uint32_t meshSlot(const aiScene* scene, const aiMesh* mesh) {
-    thread_local std::uint32_t hint = 0;
-    if (!scene || !scene->mMeshes)
-        return base::wholeValue;
-    const std::uint32_t count = scene->mNumMeshes;
-    for (std::uint32_t n = 0; n < count; ++n) {
-        const std::uint32_t i = (hint + n) % count;
-        if (scene->mMeshes[i] == mesh) {
-            hint = i + 1;
-            return i;
-        }
-    }
-    return base::wholeValue;
-}
-
 // Copies a 3-float stream into the array attribute 'name' and releases it.
 template <class T>
 void takeStream(base::AttribMap& target, base::name_id name, aiVector3D*& source,
@@ -173,14 +155,20 @@ void takeColorSets(scene::IMesh& mesh, aiMesh& source) {
 
 base::ref<scene::IGeometry> AssimpImporter::importMesh(const aiScene* scene, aiMesh* source,
                                                        TextureList& embeddedTextures) {
+    // The scene and the texture list serve the displacement lookup, which
+    // comes with the texture conversion.
+    (void)scene;
     (void)embeddedTextures;
     if (!source || !m_factory)
         return {};
-    const std::uint32_t slot = meshSlot(scene, source);
+    const auto indexed = m_meshIndex.find(source);
+    const std::uint32_t slot = indexed != m_meshIndex.end() ? indexed->second : base::wholeValue;
     if (slot < m_meshSlots.size() && m_meshSlots[slot])
         return m_meshSlots[slot];
 
-    base::ref<base::IPlugin> created = m_factory->create(names::mesh, 3);
+    base::ref<base::IPlugin> created =
+        m_factory->create(names::mesh, base::PluginFactory::createNullIfUnknown |
+                                           base::PluginFactory::createReportUnknown);
     auto* mesh = dynamic_cast<scene::IMesh*>(created.get());
     if (!mesh)
         return {};
@@ -215,7 +203,7 @@ base::ref<scene::IGeometry> AssimpImporter::importMesh(const aiScene* scene, aiM
     takeColorSets(*mesh, *source);
 
     base::ref<scene::IGeometry> answer(mesh);
-    if (source->mNumBones > 0 && vertexCount != 0) {
+    if (source->mNumBones > 0 && source->mBones && vertexCount != 0) {
         if (base::ref<scene::IGeometry> skin = buildSkin(*m_factory, *mesh, meshName, *source))
             answer = skin;
     }

@@ -39,8 +39,11 @@ public:
     SharedArrayPool& operator=(const SharedArrayPool&) = delete;
 
     // Forgets every pooled path.
-    void clear() noexcept { m_entries.clear(); }
-    std::size_t size() const noexcept { return m_entries.size(); }
+    void clear() noexcept {
+        m_shapes.clear();
+        m_size = 0;
+    }
+    std::size_t size() const noexcept { return m_size; }
 
     // Offers the attributes of 'object': arrays of at least 3 items equal to a
     // pooled one become links to it, the others are pooled. Answers the number
@@ -53,10 +56,22 @@ private:
     // The link that replaces 'attribute', or null; counts links made below it.
     base::Attribute* offer(Walk& walk, base::Attribute& attribute, std::uint32_t& linked);
 
-    using Entries =
+    using ByHash =
         std::multimap<std::uint64_t, base::AttribPath, std::less<std::uint64_t>,
                       base::StdAllocator<std::pair<const std::uint64_t, base::AttribPath>>>;
-    Entries m_entries;
+    // The arrays of one type and item count. Only arrays of the same shape
+    // can be equal, so an array is hashed once a second one of its shape
+    // arrives: a mesh whose arrays all differ pays no hashing.
+    struct Shape {
+        base::AttribPath unhashed; // the first of its shape, until a second comes
+        bool hasUnhashed = false;
+        ByHash byHash;
+    };
+    using ShapeKey = std::pair<base::name_id, std::uint32_t>;
+    std::map<ShapeKey, Shape, std::less<ShapeKey>,
+             base::StdAllocator<std::pair<const ShapeKey, Shape>>>
+        m_shapes;
+    std::size_t m_size = 0;
 };
 
 // Writes the bind pose and the joint weights of 'source's bones on 'mesh'

@@ -204,7 +204,8 @@ base::ref<scene::INode> AssimpImporter::importNode(const aiScene* scene, const a
     if (!children)
         return result;
     children->items().clear();
-    children->items().reserve(std::size_t(node->mNumChildren) + node->mNumMeshes);
+    children->items().reserve((node->mChildren ? std::size_t(node->mNumChildren) : 0) +
+                              (node->mMeshes ? node->mNumMeshes : 0));
     // Some readers leave holes in the child list (the raw format does): a
     // missing child is skipped, not followed.
     for (unsigned i = 0; node->mChildren && i < node->mNumChildren; ++i) {

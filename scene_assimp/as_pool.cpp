@@ -68,16 +68,30 @@ base::Attribute* SharedArrayPool::offer(Walk& walk, base::Attribute& attribute,
         return nullptr;
     }
 
-    if (attribute.size() < 3)
+    if (attribute.size() < 3 || !attribute.data(base::wholeValue))
         return nullptr;
+
+    Shape& shape = m_shapes[{attribute.typeName(), attribute.size()}];
+    if (!shape.hasUnhashed && shape.byHash.empty()) {
+        shape.unhashed = walk.path();
+        shape.hasUnhashed = true;
+        ++m_size;
+        return nullptr;
+    }
     const std::uint64_t hash = attribute.hash();
     if (hash == 0)
         return nullptr;
-    const void* value = attribute.data(base::wholeValue);
-    if (!value)
-        return nullptr;
+    if (shape.hasUnhashed) {
+        // An attribute that hashes to 0 (or is gone) never matches.
+        if (const base::Attribute* first = shape.unhashed.resolve())
+            if (const std::uint64_t firstHash = first->hash())
+                shape.byHash.emplace(firstHash, shape.unhashed);
+        shape.unhashed = base::AttribPath();
+        shape.hasUnhashed = false;
+    }
 
-    auto [first, last] = m_entries.equal_range(hash);
+    const void* value = attribute.data(base::wholeValue);
+    auto [first, last] = shape.byHash.equal_range(hash);
     for (auto it = first; it != last; ++it) {
         const base::Attribute* pooled = it->second.resolve();
         if (!pooled || pooled == &attribute || pooled->typeName() != attribute.typeName())
@@ -85,7 +99,8 @@ base::Attribute* SharedArrayPool::offer(Walk& walk, base::Attribute& attribute,
         if (pooled->compare(value) == 0)
             return new base::AttribLink(it->second);
     }
-    m_entries.emplace(hash, walk.path());
+    shape.byHash.emplace(hash, walk.path());
+    ++m_size;
     return nullptr;
 }
 

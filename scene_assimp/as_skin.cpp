@@ -80,7 +80,7 @@ base::ref<scene::IGeometry> buildSkin(base::PluginFactory& factory, scene::IMesh
         for (std::uint32_t w = 0; w < bone->mNumWeights; ++w) {
             aiVertexWeight& weight = bone->mWeights[w];
             if (weight.mVertexId >= vertexCount) {
-                base::logFormatted(base::logScene, 2,
+                base::logFormatted(base::logScene, base::logError,
                                    "assimp import {}| Invalid vertex '{}' used by joint {}!",
                                    meshName, weight.mVertexId, boneName(bone));
                 weight.mVertexId = 0;
@@ -155,11 +155,13 @@ base::ref<scene::IGeometry> buildSkin(base::PluginFactory& factory, scene::IMesh
     else if (maximum < 65535)
         writeCounts<std::uint16_t>(set, counts, maximum);
     else
-        base::logFormatted(base::logScene, 2,
+        base::logFormatted(base::logScene, base::logError,
                            "assimp import {}| Can't support more then 65536 joints per vertex!",
                            meshName);
 
-    base::ref<base::IPlugin> created = factory.create(names::skin, 3);
+    base::ref<base::IPlugin> created =
+        factory.create(names::skin, base::PluginFactory::createNullIfUnknown |
+                                        base::PluginFactory::createReportUnknown);
     auto* skin = dynamic_cast<scene::ISkin*>(created.get());
     if (!skin)
         return {};
@@ -191,7 +193,7 @@ void AssimpImporter::resolveJoints(const aiScene* scene, const NodeMap& nodesByN
             if (found != nodesByName.end()) {
                 items.emplace_back(found->second);
             } else {
-                base::logFormatted(base::logScene, 2,
+                base::logFormatted(base::logScene, base::logError,
                                    "assimp import {}| Unable to resolve joint '{}'! No such "
                                    "node found.",
                                    object.name(true), name);

@@ -13,6 +13,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <iterator>
 
 namespace scene {
 
@@ -22,18 +23,33 @@ using PluginRef = ::base::ref<::base::IPlugin>;
 
 // Refills the output 'name' when the adapter holds it as an array of T.
 template <class T>
-void present(IBufferAdapter& adapter, ::base::name_id name, const std::uint8_t* bytes,
-             std::size_t length, std::uint64_t stamp) {
+bool present(IBufferAdapter& adapter, ::base::name_id name, const std::uint8_t* bytes,
+             std::size_t length) {
     ::base::Attribute* output = adapter.findEntry(name);
     if (!output || output->typeName() != ::base::TypeTraits<T>::n_array_name)
-        return;
+        return false;
     ::base::ArrayOf<T> items(length / sizeof(T));
     if (!items.empty())
         std::memcpy(static_cast<void*>(items.data()), bytes, items.size() * sizeof(T));
     // Swapping gives back the old storage instead of keeping its capacity.
     static_cast<::base::TypedVectorAttribute<T>*>(output)->items().swap(items);
-    adapter.notify(name, ::base::PluginCallback::changeKind, stamp);
+    return true;
 }
+
+// The outputs in the order they are filled and announced.
+struct Output {
+    const ::base::name_id* name;
+    bool (*present)(IBufferAdapter&, ::base::name_id, const std::uint8_t*, std::size_t);
+};
+constexpr Output outputs[] = {
+    {&names::outputUint8, &present<std::uint8_t>},
+    {&names::outputUint16, &present<std::uint16_t>},
+    {&names::outputUint32, &present<std::uint32_t>},
+    {&names::outputFloat, &present<float>},
+    {&names::outputFloat2, &present<::base::vec2f>},
+    {&names::outputFloat3, &present<::base::vec3f>},
+    {&names::outputFloat4, &present<::base::vec4f>},
+};
 
 bool isInput(::base::name_id attribute) {
     return attribute.empty() || attribute == names::inputBuffer ||
@@ -95,13 +111,14 @@ void IBufferAdapter::update(std::uint64_t stamp) {
         std::min<std::size_t>(get(*this, names::inputLength, 0xFFFFFFFFu), size - offset);
     const std::uint8_t* bytes = data->data() + offset;
 
-    present<std::uint8_t>(*this, names::outputUint8, bytes, length, stamp);
-    present<std::uint16_t>(*this, names::outputUint16, bytes, length, stamp);
-    present<std::uint32_t>(*this, names::outputUint32, bytes, length, stamp);
-    present<float>(*this, names::outputFloat, bytes, length, stamp);
-    present<::base::vec2f>(*this, names::outputFloat2, bytes, length, stamp);
-    present<::base::vec3f>(*this, names::outputFloat3, bytes, length, stamp);
-    present<::base::vec4f>(*this, names::outputFloat4, bytes, length, stamp);
+    // Every output is filled before any listener hears of one: a listener
+    // may change or drop the buffer, and its bytes must not be read after.
+    bool filled[std::size(outputs)];
+    for (std::size_t i = 0; i < std::size(outputs); ++i)
+        filled[i] = outputs[i].present(*this, *outputs[i].name, bytes, length);
+    for (std::size_t i = 0; i < std::size(outputs); ++i)
+        if (filled[i])
+            notify(*outputs[i].name, ::base::PluginCallback::changeKind, stamp);
 }
 
 void IBufferAdapter::pluginChanged(::base::IPlugin& plugin, ::base::name_id attribute,

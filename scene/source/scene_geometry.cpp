@@ -56,6 +56,13 @@ const AttribArray* mapArray(const AttribMap& map, name_id name) {
     return found ? const_cast<Attribute*>(found)->asArray() : nullptr;
 }
 
+// Whether 'map' holds the array 'name' itself: not through a link and not
+// inherited from a base map.
+bool ownsArray(const AttribMap& map, name_id name) {
+    Attribute* entry = const_cast<AttribMap&>(map).findEntry(name);
+    return entry && !entry->asLink() && entry->asArray();
+}
+
 const AttribMap* itemMap(Attribute* item) {
     return item ? item->asMap() : nullptr;
 }
@@ -427,20 +434,21 @@ bool IMesh::deltaCompressIndices() {
     bool takeable = true;
     auto take = [&](AttribMap& owner, name_id name) {
         Attribute* entry = owner.findEntry(name);
-        if (!entry)
+        if (!entry) {
+            // An array seen only through a base map is another object's: it
+            // could not follow the reordered faces.
+            if (owner.findInherited(name))
+                takeable = false;
             return;
+        }
         if (entry->asLink() || entry->typeName() != ::base::TypeTraits<std::uint32_t>::n_array_name)
             takeable = false;
         else
             channels.push_back(&static_cast<IndexAttribute*>(entry)->items());
     };
     take(*this, names::indices);
-    if (channels.empty()) {
-        // Indices seen only through a base map are another object's.
-        if (findInherited(names::indices))
-            takeable = false;
+    if (channels.empty())
         channels.push_back(&none);
-    }
     for (name_id name : {names::positionIndices, names::normalIndices, names::tangentIndices})
         take(*this, name);
     for (name_id sets : {names::uvSets, names::colorSets})
@@ -458,7 +466,7 @@ bool IMesh::deltaCompressIndices() {
             takeable = false;
 
     const AttribArray* primitives = mapArray(*this, names::primitives);
-    if (Attribute* entry = findEntry(names::primitives); entry && entry->asLink())
+    if (primitives && !ownsArray(*this, names::primitives))
         takeable = false;
     const ::base::vector<Layout> layouts =
         takeable ? codedPrimitives(primitives, total) : ::base::vector<Layout>();
@@ -514,6 +522,9 @@ void IMesh::computeBounds(::base::box3d& result, std::uint32_t mode, bool) {
         extend(everything, p);
 
     const AttribArray* primitives = mapArray(*this, names::primitives);
+    // Primitive boxes are kept only in this mesh's own primitives: a linked or
+    // inherited list belongs to another mesh, whose geometry may differ.
+    const bool keepPrimitiveBoxes = cachingMode(mode) && ownsArray(*this, names::primitives);
     if (!primitives || !indices) {
         result = everything;
     } else {
@@ -539,7 +550,7 @@ void IMesh::computeBounds(::base::box3d& result, std::uint32_t mode, bool) {
                 for (std::size_t i = from; i < to; ++i)
                     if ((*indices)[i] < positions.size())
                         extend(box, positions[(*indices)[i]]);
-                if (cachingMode(mode))
+                if (keepPrimitiveBoxes)
                     primitive->setAttribute(names::bounds, box);
             }
             result.unite(box);

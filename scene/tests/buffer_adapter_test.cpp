@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <numeric>
 #include <string>
 #include <vector>
@@ -169,6 +170,33 @@ TEST_F(Adapter, AnotherBufferReplacesTheOldOneSafely) {
     adapter->removeAttribute(names::inputBuffer);
     other.reset();
     EXPECT_EQ(bytesOut()[1], 2);
+}
+
+// A listener of the first output that shrinks the buffer: the outputs after
+// it still hold the bytes of the run that announced them.
+TEST_F(Adapter, ListenersChangingTheBufferDoNotDisturbTheRun) {
+    struct Shrinker : base::PluginCallback {
+        IPlugin* buffer = nullptr;
+        void pluginChanged(IPlugin&, name_id attribute, std::uint32_t, std::uint64_t) override {
+            if (attribute == names::outputUint8 && buffer) {
+                auto& bytes = buffer->vecAttribute<std::uint8_t>(names::data)->items();
+                bytes.clear();
+                bytes.shrink_to_fit();
+                buffer = nullptr;
+            }
+        }
+    } shrinker;
+    shrinker.buffer = buffer.get();
+    adapter->addListener(shrinker);
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->update();
+    adapter->removeListener(shrinker);
+    EXPECT_EQ(counts(), (std::vector<std::uint32_t>{10, 5, 2, 2, 1, 0, 0}));
+    const auto& floats = *adapter->findVecAttribute<base::vec2f>(names::outputFloat2);
+    float expected;
+    const std::uint8_t bytes[] = {0, 1, 2, 3};
+    std::memcpy(&expected, bytes, 4);
+    EXPECT_EQ(floats[0].x, expected);
 }
 
 } // namespace

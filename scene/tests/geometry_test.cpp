@@ -265,6 +265,18 @@ TEST_F(Geometry, UncodableIndexChannelsLeaveTheMeshUnchanged) {
          [](IMesh& mesh, IMesh&) {
              mesh.vecAttribute<std::uint16_t>(names::indices)->items() = {4, 2, 3};
          }},
+        // Arrays seen through a base map are the base's: reordering the faces
+        // would leave them behind or rewrite them.
+        {"inherited corner channel",
+         [](IMesh& mesh, IMesh& other) {
+             other.vecAttribute<std::uint32_t>(names::normalIndices)->items() = {0, 1, 2, 3, 4, 5};
+             mesh.setBase(&other);
+         }},
+        {"inherited primitives",
+         [](IMesh& mesh, IMesh& other) {
+             mesh.removeAttribute(names::primitives);
+             mesh.setBase(&other);
+         }},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);

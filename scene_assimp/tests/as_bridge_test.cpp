@@ -217,6 +217,9 @@ TEST(AssimpStream, ReadAnswersWholeElements) {
         {base::streamStrictRead, 3, 10, 10, 0},
         {0, 0, 10, 0, 0},
         {0, 1, 0, 0, 0},
+        // A request whose byte count overflows is refused before the stream
+        // is touched: no buffer can hold it.
+        {0, SIZE_MAX / 2, 4, 0, 0},
     };
     for (const Row& row : rows) {
         SCOPED_TRACE(testing::Message() << row.flags << " " << row.size << "x" << row.count);
@@ -230,6 +233,9 @@ TEST(AssimpStream, ReadAnswersWholeElements) {
                   row.logged);
         if (row.expected == 7) {
             EXPECT_EQ(buffer[0], 10);
+        }
+        if (row.size == SIZE_MAX / 2) {
+            EXPECT_EQ(stream->Tell(), 10u);
         }
         delete stream;
     }

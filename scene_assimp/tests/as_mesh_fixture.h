@@ -26,10 +26,7 @@ struct ImporterTestAccess {
 
     static void meshBeginImport(AssimpImporter& importer, base::PluginFactory& factory,
                                 const aiScene& scene) {
-        importer.m_factory = &factory;
-        importer.m_meshSlots.assign(scene.mNumMeshes, {});
-        importer.m_arrayPool.clear();
-        importer.m_nodeMemo.clear();
+        importer.beginImport(factory, &scene);
     }
     static base::ref<scene::INode> meshImportNode(AssimpImporter& importer, const aiScene& scene,
                                                   const aiNode& node) {

@@ -20,8 +20,7 @@ struct NodeTestAccess {
     static base::ref<scene::INode> importNode(AssimpImporter& importer,
                                               base::PluginFactory& factory, const aiScene* scene,
                                               const aiNode* node) {
-        importer.m_factory = &factory;
-        importer.m_nodeMemo.clear();
+        importer.beginImport(factory, scene);
         AssimpImporter::TextureList textures;
         return importer.importNode(scene, node, textures);
     }
