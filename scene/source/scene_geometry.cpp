@@ -577,24 +577,27 @@ bool IMesh::validate() const {
         checkVectors(report, *tangents, "tangents", P, true, true, result);
     if (const auto* velocities = findVecAttribute<::base::vec3f>(names::velocities))
         checkVectors(report, *velocities, "velocities", P, false, false, result);
-    if (const AttribArray* sets = findArray(names::colorSets))
-        for (Attribute* item : sets->items())
-            if (const AttribMap* set = itemMap(item)) {
-                if (const auto* rgb = set->findVecAttribute<::base::vec3f>(names::RGB))
-                    checkVectors(report, *rgb, "rgb colors", P, false, false, result);
-                if (const auto* rgba = set->findVecAttribute<::base::vec4f>(names::RGBA))
-                    checkVectors(report, *rgba, "rgba colors", P, false, false, result);
-            }
-    if (const AttribArray* sets = findArray(names::uvSets))
-        for (Attribute* item : sets->items())
-            if (const AttribMap* set = itemMap(item)) {
-                if (const auto* uv = set->findVecAttribute<::base::vec2f>(names::UV))
-                    checkVectors(report, *uv, "uv coordinates", P, false, false, result);
-                if (const auto* uvw = set->findVecAttribute<::base::vec3f>(names::UVW))
-                    checkVectors(report, *uvw, "uvw coordinates", P, false, false, result);
-                if (const auto* uvwq = set->findVecAttribute<::base::vec4f>(names::UVWQ))
-                    checkVectors(report, *uvwq, "uvwq coordinates", P, false, false, result);
-            }
+    // The per-vertex arrays of every colour and UV set; the last argument
+    // only carries the item type.
+    auto checkSetArray = [&](const AttribMap& set, name_id name, const char* label, auto item) {
+        if (const auto* items = set.findVecAttribute<decltype(item)>(name))
+            checkVectors(report, *items, label, P, false, false, result);
+    };
+    auto forEachSet = [&](name_id sets, auto&& check) {
+        if (const AttribArray* array = findArray(sets))
+            for (Attribute* item : array->items())
+                if (const AttribMap* set = itemMap(item))
+                    check(*set);
+    };
+    forEachSet(names::colorSets, [&](const AttribMap& set) {
+        checkSetArray(set, names::RGB, "rgb colors", ::base::vec3f{});
+        checkSetArray(set, names::RGBA, "rgba colors", ::base::vec4f{});
+    });
+    forEachSet(names::uvSets, [&](const AttribMap& set) {
+        checkSetArray(set, names::UV, "uv coordinates", ::base::vec2f{});
+        checkSetArray(set, names::UVW, "uvw coordinates", ::base::vec3f{});
+        checkSetArray(set, names::UVWQ, "uvwq coordinates", ::base::vec4f{});
+    });
 
     const AttribArray* primitives = findArray(names::primitives);
     // Coded indices would report their differences as out of range.
