@@ -9,6 +9,7 @@
 
 #include <algorithm>
 #include <cstring>
+#include <numeric>
 #include <string>
 
 namespace {
@@ -25,80 +26,51 @@ std::size_t countWith(const CaptureLog& log, std::string_view text) {
 
 // ---- Log bridge ----
 
-struct LoggedLine {
-    int level;
-    std::string message;
-};
-
-std::vector<LoggedLine> lines(const CaptureLog& log) {
-    std::vector<LoggedLine> out;
-    for (const auto& e : log.entries()) {
-        EXPECT_EQ(e.channel, base::logScene);
-        out.push_back({e.level, std::string(e.message)});
-    }
-    return out;
-}
-
 constexpr const char* skipping = "Skipping one or more lines with the same contents...";
 
+struct LoggerCase {
+    const char* label;
+    std::vector<std::pair<void (as::AssimpLogger::*)(const char*), const char*>> calls;
+    std::vector<std::pair<int, std::string>> expected; // level, message
+};
+
 TEST(AssimpLogger, FoldsRunsOfEqualMessages) {
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    auto* logger = new as::AssimpLogger();
-    logger->warn("same");
-    logger->warn("same");
-    logger->warn("same");
-    logger->OnError("other");
-    logger->OnError("other");
-    EXPECT_FALSE(logger->attachStream(nullptr, 0));
-    EXPECT_FALSE(logger->detachStream(nullptr, 0));
-    delete logger;
-
-    const auto got = lines(capture);
-    ASSERT_EQ(got.size(), 4u);
-    EXPECT_EQ(got[0].level, 3);
-    EXPECT_EQ(got[0].message, "assimp| same");
-    EXPECT_EQ(got[1].level, 4);
-    EXPECT_EQ(got[1].message, skipping);
-    EXPECT_EQ(got[2].level, 2);
-    EXPECT_EQ(got[2].message, "assimp| other");
-    EXPECT_EQ(got[3].message, skipping);
-}
-
-TEST(AssimpLogger, AlternatingMessagesAreAllForwarded) {
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    as::AssimpLogger* logger = new as::AssimpLogger();
-    logger->OnInfo("a");
-    logger->OnDebug("b");
-    logger->OnVerboseDebug("a");
-    delete logger;
-
-    const auto got = lines(capture);
-    ASSERT_EQ(got.size(), 3u);
-    EXPECT_EQ(got[0].level, 4);
-    EXPECT_EQ(got[1].level, 5);
-    EXPECT_EQ(got[1].message, "assimp| b");
-    EXPECT_EQ(got[2].level, 5);
-    EXPECT_EQ(got[2].message, "assimp| a");
-}
-
-TEST(AssimpLogger, EmptyFirstMessageCountsAsRepeat) {
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    as::AssimpLogger* logger = new as::AssimpLogger();
-    logger->OnError("");
-    logger->OnError("");
-    delete logger;
-    const auto got = lines(capture);
-    ASSERT_EQ(got.size(), 1u);
-    EXPECT_EQ(got[0].level, 4);
-    EXPECT_EQ(got[0].message, skipping);
+    using L = as::AssimpLogger;
+    const LoggerCase cases[] = {
+        {"runs",
+         {{&L::OnWarn, "same"},
+          {&L::OnWarn, "same"},
+          {&L::OnWarn, "same"},
+          {&L::OnError, "other"},
+          {&L::OnError, "other"}},
+         {{3, "assimp| same"}, {4, skipping}, {2, "assimp| other"}, {4, skipping}}},
+        {"alternating",
+         {{&L::OnInfo, "a"}, {&L::OnDebug, "b"}, {&L::OnVerboseDebug, "a"}},
+         {{4, "assimp| a"}, {5, "assimp| b"}, {5, "assimp| a"}}},
+        {"emptyFirst", {{&L::OnError, ""}, {&L::OnError, ""}}, {{4, skipping}}},
+    };
+    for (const LoggerCase& c : cases) {
+        SCOPED_TRACE(c.label);
+        CaptureLog capture;
+        ScopedLog scoped(capture);
+        auto* logger = new as::AssimpLogger();
+        for (const auto& [call, message] : c.calls)
+            (logger->*call)(message);
+        EXPECT_FALSE(logger->attachStream(nullptr, 0));
+        EXPECT_FALSE(logger->detachStream(nullptr, 0));
+        delete logger;
+        std::vector<std::pair<int, std::string>> got;
+        for (const auto& e : capture.entries()) {
+            EXPECT_EQ(e.channel, base::logScene);
+            got.emplace_back(e.level, std::string(e.message));
+        }
+        EXPECT_EQ(got, c.expected);
+    }
 }
 
 // ---- File bridge ----
 
-// A file system that holds a few virtual files under one prefix and records
+// A file system that holds 30-byte ".bin" files under one prefix and records
 // the flags of every open; attached once, after the native one.
 class VirtualFS final : public base::fs::IPlugin {
 public:
@@ -112,7 +84,6 @@ public:
         }();
         return *fs;
     }
-
     const base::fs::PluginDesc& pluginDesc() const override {
         static Desc desc;
         return desc;
@@ -124,9 +95,8 @@ public:
         if (!path.starts_with(prefix))
             return {};
         lastFlags = flags;
-        if (!path.ends_with(".bin"))
-            return {};
-        return base::memoryStream(path, base::vector<std::uint8_t>(30, 7));
+        return exists(path) ? base::memoryStream(path, base::vector<std::uint8_t>(30, 7))
+                            : base::Stream();
     }
 
     std::uint32_t lastFlags = 0;
@@ -138,13 +108,14 @@ private:
     };
 };
 
-TEST(AssimpIO, OpensThroughTheMasterFileSystemWithModeFlags) {
+TEST(AssimpIO, OpensThroughTheMasterFileSystem) {
     VirtualFS& fs = VirtualFS::instance();
+    CaptureLog capture;
+    ScopedLog scoped(capture);
     as::AssimpIO io;
     const std::string path = std::string(VirtualFS::prefix) + "data.bin";
     EXPECT_TRUE(io.Exists(path.c_str()));
     EXPECT_EQ(io.getOsSeparator(), '/');
-
     const std::pair<const char*, std::uint32_t> modes[] = {
         {"rb", 13}, {"rt", 13}, {"r", 13}, {"wb", 2}, {"wt", 2}};
     for (const auto& [mode, flags] : modes) {
@@ -156,24 +127,13 @@ TEST(AssimpIO, OpensThroughTheMasterFileSystemWithModeFlags) {
         io.Close(stream);
     }
     io.Close(nullptr);
-}
 
-TEST(AssimpIO, MissingFileAnswersNullSilently) {
-    VirtualFS::instance();
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    as::AssimpIO io;
+    // A missing file answers null without a log line; other failures are logged.
     const std::string virtualMissing = std::string(VirtualFS::prefix) + "missing.mtl";
     EXPECT_FALSE(io.Exists(virtualMissing.c_str()));
     EXPECT_EQ(io.Open(virtualMissing.c_str(), "rb"), nullptr);
     EXPECT_EQ(io.Open("/no/such/folder/model.obj", "rb"), nullptr);
     EXPECT_TRUE(capture.entries().empty());
-}
-
-TEST(AssimpIO, OtherOpenFailuresAreLoggedAndAnswerNull) {
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    as::AssimpIO io;
     EXPECT_EQ(io.Open("", "rb"), nullptr);
     EXPECT_EQ(countWith(capture, "file name not provided"), 1u);
 }
@@ -184,9 +144,7 @@ public:
     explicit ShortWriter(std::uint64_t limit)
         : StreamWorker("short", base::capWrite), m_limit(limit) {}
     std::uint64_t read(void*, std::uint64_t) override { return 0; }
-    std::uint64_t write(const void*, std::uint64_t bytes) override {
-        return std::min(bytes, m_limit);
-    }
+    std::uint64_t write(const void*, std::uint64_t n) override { return std::min(n, m_limit); }
     std::uint64_t setPosition(std::int64_t, std::uint32_t) override { return 0; }
     std::uint64_t getPosition() override { return 0; }
     std::uint64_t getSize() override { return 0; }
@@ -199,28 +157,23 @@ private:
 
 as::AssimpStream* memoryAssimpStream(std::size_t bytes, std::uint32_t flags = 0) {
     base::vector<std::uint8_t> data(bytes);
-    for (std::size_t i = 0; i < bytes; ++i)
-        data[i] = std::uint8_t(i);
+    std::iota(data.begin(), data.end(), std::uint8_t(0));
     return new as::AssimpStream(base::memoryStream("mem", std::move(data), flags));
 }
 
 TEST(AssimpStream, ReadAnswersWholeElements) {
     struct Row {
         std::uint32_t flags;
-        std::size_t size, count, expected;
-        std::size_t logged;
+        std::size_t size, count, expected, logged;
     };
-    // 30 bytes left in every row.
-    const Row rows[] = {
-        {0, 4, 10, 7, 0},
-        {base::streamStrictRead, 4, 10, 0, 1},
-        {base::streamStrictRead, 3, 10, 10, 0},
-        {0, 0, 10, 0, 0},
-        {0, 1, 0, 0, 0},
-        // A request whose byte count overflows is refused before the stream
-        // is touched: no buffer can hold it.
-        {0, SIZE_MAX / 2, 4, 0, 0},
-    };
+    // 30 bytes left in every row. A request whose byte count overflows is
+    // refused before the stream is touched: no buffer can hold it.
+    const Row rows[] = {{0, 4, 10, 7, 0},
+                        {base::streamStrictRead, 4, 10, 0, 1},
+                        {base::streamStrictRead, 3, 10, 10, 0},
+                        {0, 0, 10, 0, 0},
+                        {0, 1, 0, 0, 0},
+                        {0, SIZE_MAX / 2, 4, 0, 0}};
     for (const Row& row : rows) {
         SCOPED_TRACE(testing::Message() << row.flags << " " << row.size << "x" << row.count);
         CaptureLog capture;
@@ -241,20 +194,20 @@ TEST(AssimpStream, ReadAnswersWholeElements) {
     }
 }
 
-TEST(AssimpStream, StrictShortWriteIsLoggedNotThrown) {
-    CaptureLog capture;
-    ScopedLog scoped(capture);
-    as::AssimpStream stream(
-        base::Stream(base::ref<base::StreamWorker>(new ShortWriter(10)), base::streamStrictWrite));
+TEST(AssimpStream, ShortWriteAnswersWholeElementsStrictIsLoggedNotThrown) {
     const char data[16] = {};
-    size_t written = 99;
-    EXPECT_NO_THROW(written = stream.Write(data, 4, 4));
-    EXPECT_EQ(written, 2u);
-    EXPECT_EQ(countWith(capture, "stream 'short': trying to write 16 bytes, written 10 bytes"), 1u);
-
-    as::AssimpStream lenient(base::Stream(base::ref<base::StreamWorker>(new ShortWriter(10))));
-    EXPECT_EQ(lenient.Write(data, 4, 4), 2u);
-    EXPECT_EQ(lenient.Write(data, 0, 4), 0u);
+    for (std::uint32_t flags : {std::uint32_t(base::streamStrictWrite), std::uint32_t(0)}) {
+        CaptureLog capture;
+        ScopedLog scoped(capture);
+        as::AssimpStream stream(
+            base::Stream(base::ref<base::StreamWorker>(new ShortWriter(10)), flags));
+        size_t written = 99;
+        EXPECT_NO_THROW(written = stream.Write(data, 4, 4));
+        EXPECT_EQ(written, 2u);
+        EXPECT_EQ(stream.Write(data, 0, 4), 0u);
+        EXPECT_EQ(countWith(capture, "stream 'short': trying to write 16 bytes, written 10 bytes"),
+                  flags ? 1u : 0u);
+    }
 }
 
 TEST(AssimpStream, SeekReportsWhetherTheImpliedPositionWasReached) {
@@ -264,19 +217,14 @@ TEST(AssimpStream, SeekReportsWhetherTheImpliedPositionWasReached) {
         aiReturn expected;
         std::size_t position;
     };
-    // Applied in order to one 100-byte stream.
+    // Applied in order to one 100-byte stream. Before the start the host clamps
+    // to 0, which is not where we asked to go.
     const Row rows[] = {
-        {10, aiOrigin_SET, aiReturn_SUCCESS, 10},
-        {5, aiOrigin_CUR, aiReturn_SUCCESS, 15},
-        {-10, aiOrigin_END, aiReturn_SUCCESS, 90},
-        {-5, aiOrigin_CUR, aiReturn_SUCCESS, 85},
-        {0, aiOrigin_END, aiReturn_SUCCESS, 100},
-        {0, aiOrigin_SET, aiReturn_SUCCESS, 0},
-        // Before the start: the host clamps to 0, which is not where we asked to go.
-        {-200, aiOrigin_CUR, aiReturn_FAILURE, 0},
-        {-5, aiOrigin_SET, aiReturn_FAILURE, 0},
-        {120, aiOrigin_SET, aiReturn_SUCCESS, 120},
-    };
+        {10, aiOrigin_SET, aiReturn_SUCCESS, 10},  {5, aiOrigin_CUR, aiReturn_SUCCESS, 15},
+        {-10, aiOrigin_END, aiReturn_SUCCESS, 90}, {-5, aiOrigin_CUR, aiReturn_SUCCESS, 85},
+        {0, aiOrigin_END, aiReturn_SUCCESS, 100},  {0, aiOrigin_SET, aiReturn_SUCCESS, 0},
+        {-200, aiOrigin_CUR, aiReturn_FAILURE, 0}, {-5, aiOrigin_SET, aiReturn_FAILURE, 0},
+        {120, aiOrigin_SET, aiReturn_SUCCESS, 120}};
     as::AssimpStream* stream = memoryAssimpStream(100);
     for (const Row& row : rows) {
         SCOPED_TRACE(testing::Message() << row.offset << " from " << int(row.origin));

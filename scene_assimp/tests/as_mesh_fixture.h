@@ -14,8 +14,11 @@
 #include <assimp/scene.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <initializer_list>
 #include <vector>
+
+extern "C" std::int32_t loadScenePlugin(base::PluginFactory& factory);
 
 namespace as {
 
@@ -50,37 +53,37 @@ struct ImporterTestAccess {
 
 namespace meshtest {
 
+// A factory with the scene types and the module's importer registered.
+inline base::ref<base::PluginFactory> loadedFactory(const char* name = "test") {
+    base::ref<base::PluginFactory> factory(new base::PluginFactory(name));
+    scene::register_scene_schema(*factory);
+    EXPECT_EQ(loadScenePlugin(*factory), 0);
+    return factory;
+}
+
 namespace names = scene::names;
 
-struct Vec {
-    float x, y, z;
-};
+using Faces = std::vector<std::vector<unsigned>>;
+
+inline void setFaces(aiMesh& mesh, const Faces& faces) {
+    mesh.mNumFaces = unsigned(faces.size());
+    mesh.mFaces = faces.empty() ? nullptr : new aiFace[faces.size()];
+    for (std::size_t f = 0; f < faces.size(); ++f) {
+        mesh.mFaces[f].mNumIndices = unsigned(faces[f].size());
+        mesh.mFaces[f].mIndices = new unsigned[faces[f].size()];
+        std::copy(faces[f].begin(), faces[f].end(), mesh.mFaces[f].mIndices);
+    }
+}
 
 // A source mesh with the given positions and faces (each face a list of indices).
-inline aiMesh* makeMesh(const char* name, std::initializer_list<Vec> positions,
-                        std::initializer_list<std::initializer_list<unsigned>> faces) {
+inline aiMesh* makeMesh(const char* name, std::initializer_list<aiVector3D> positions,
+                        const Faces& faces = {}) {
     auto* mesh = new aiMesh;
     mesh->mName = aiString(name);
     mesh->mNumVertices = unsigned(positions.size());
-    if (positions.size()) {
-        mesh->mVertices = new aiVector3D[positions.size()];
-        unsigned i = 0;
-        for (const Vec& p : positions)
-            mesh->mVertices[i++] = aiVector3D(p.x, p.y, p.z);
-    }
-    if (faces.size()) {
-        mesh->mNumFaces = unsigned(faces.size());
-        mesh->mFaces = new aiFace[faces.size()];
-        unsigned f = 0;
-        for (const auto& face : faces) {
-            mesh->mFaces[f].mNumIndices = unsigned(face.size());
-            mesh->mFaces[f].mIndices = new unsigned[face.size()];
-            unsigned i = 0;
-            for (unsigned index : face)
-                mesh->mFaces[f].mIndices[i++] = index;
-            ++f;
-        }
-    }
+    mesh->mVertices = new aiVector3D[positions.size()];
+    std::copy(positions.begin(), positions.end(), mesh->mVertices);
+    setFaces(*mesh, faces);
     return mesh;
 }
 
@@ -105,13 +108,18 @@ inline aiBone* addBone(aiMesh& mesh, const char* name,
     for (const auto& [vertex, weight] : weights)
         bone->mWeights[i++] = aiVertexWeight(vertex, weight);
     auto** bones = new aiBone*[mesh.mNumBones + 1];
-    for (unsigned b = 0; b < mesh.mNumBones; ++b)
-        bones[b] = mesh.mBones[b];
-    bones[mesh.mNumBones] = bone;
+    std::copy_n(mesh.mBones, mesh.mNumBones, bones);
+    bones[mesh.mNumBones++] = bone;
     delete[] mesh.mBones;
     mesh.mBones = bones;
-    ++mesh.mNumBones;
     return bone;
+}
+
+inline aiNode* withChildren(const char* name, std::initializer_list<aiNode*> kids) {
+    auto* node = new aiNode(name);
+    std::vector<aiNode*> list(kids);
+    node->addChildren(unsigned(list.size()), list.data());
+    return node;
 }
 
 // The meshes in a scene that owns them.
@@ -119,10 +127,19 @@ inline aiScene* makeScene(std::initializer_list<aiMesh*> meshes) {
     auto* scene = new aiScene;
     scene->mNumMeshes = unsigned(meshes.size());
     scene->mMeshes = new aiMesh*[meshes.size()];
-    unsigned i = 0;
-    for (aiMesh* mesh : meshes)
-        scene->mMeshes[i++] = mesh;
+    std::copy(meshes.begin(), meshes.end(), scene->mMeshes);
     return scene;
+}
+
+// The objects of 'type' in 'factory', in creation order.
+inline std::vector<base::ref<base::IPlugin>> objectsOf(const base::PluginFactory& factory,
+                                                       base::name_id type) {
+    std::vector<base::ref<base::IPlugin>> found;
+    for (std::uint32_t id = 0; id < factory.pluginCount(); ++id)
+        if (base::ref<base::IPlugin> object = factory.plugin(id);
+            object && object->className() == type)
+            found.push_back(object);
+    return found;
 }
 
 template <class T>
@@ -137,13 +154,9 @@ std::vector<T> items(const base::AttribMap& map, base::name_id name) {
 
 inline const base::AttribMap* item(const base::AttribMap& map, base::name_id name,
                                    std::uint32_t index) {
-    const base::Attribute* found = map.findEntry(name);
-    if (!found)
-        return nullptr;
-    auto* array = const_cast<base::Attribute*>(found)->asArray();
-    if (!array || !array->item(index))
-        return nullptr;
-    return array->item(index)->asMap();
+    auto* found = const_cast<base::Attribute*>(map.findEntry(name));
+    auto* array = found ? found->asArray() : nullptr;
+    return array && array->item(index) ? array->item(index)->asMap() : nullptr;
 }
 
 // A factory with the scene types, an importer bound to it, and a captured log.
@@ -154,10 +167,7 @@ protected:
         importer =
             base::ref<AssimpImporter>(new AssimpImporter(nullptr, nullptr, base::invalidPluginId));
     }
-    ~MeshTest() override {
-        if (source)
-            delete source;
-    }
+    ~MeshTest() override { delete source; }
 
     // Takes 'scene' and starts an import of it.
     void begin(aiScene* scene) {
@@ -172,24 +182,14 @@ protected:
 public:
     // The mesh behind an answer (the answer itself, or a skin's base mesh).
     static base::IPlugin* meshOf(const base::ref<scene::IGeometry>& answer) {
-        if (!answer)
-            return nullptr;
-        if (auto* skin = dynamic_cast<scene::ISkin*>(answer.get())) {
-            const auto* base = skin->findAttribute<base::ref<base::IPlugin>>(names::baseMesh);
-            return base ? base->get() : nullptr;
-        }
-        return answer.get();
+        auto* skin = dynamic_cast<scene::ISkin*>(answer.get());
+        if (!skin)
+            return answer.get();
+        const auto* base = skin->findAttribute<base::ref<base::IPlugin>>(names::baseMesh);
+        return base ? base->get() : nullptr;
     }
 
 protected:
-    std::uint32_t countOfType(base::name_id type) const {
-        std::uint32_t n = 0;
-        for (std::uint32_t i = 0; i < factory->pluginCount(); ++i)
-            if (auto p = factory->plugin(i); p && p->className() == type)
-                ++n;
-        return n;
-    }
-
     base::CaptureLog captured;
     base::ScopedLog scopedLog{captured};
     base::ref<base::PluginFactory> factory{new base::PluginFactory("test")};
