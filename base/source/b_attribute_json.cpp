@@ -217,6 +217,14 @@ AttribPath& AttribPath::addPluginId(std::uint32_t id) {
 
 namespace {
 
+// A member without its key: usually a trailing ','. Answers false.
+bool logMissingKey(DataReader& r, std::uint32_t line) {
+    logFormatted(logSystem, logError,
+                 "json parser {}| Unable to read end of object at line {}! Check for extra ','.",
+                 r.streamName(), line);
+    return false;
+}
+
 void logUnknownType(DataReader& r, name_id className, std::string_view name, std::string_view type,
                     std::uint32_t line) {
     logFormatted(logSystem, logWarning,
@@ -369,13 +377,8 @@ bool AttribMap::read(DataReader& r, std::uint32_t) {
             return true;
         const std::uint32_t line = r.line();
         std::string_view key;
-        if (!r.key(key)) {
-            logFormatted(logSystem, logError,
-                         "json parser {}| Unable to read end of object at line {}! Check for extra "
-                         "','.",
-                         r.streamName(), line);
-            return false;
-        }
+        if (!r.key(key))
+            return logMissingKey(r, line);
         // The key is only valid until the next call on the reader.
         KeyCache::Resolved resolved;
         std::string_view nameText, typeText;
@@ -438,13 +441,8 @@ bool AttribArray::read(DataReader& r, std::uint32_t index) {
             break;
         const std::uint32_t line = r.line();
         std::string_view key;
-        if (!r.key(key)) {
-            logFormatted(logSystem, logError,
-                         "json parser {}| Unable to read end of object at line {}! Check for extra "
-                         "','.",
-                         r.streamName(), line);
-            return false;
-        }
+        if (!r.key(key))
+            return logMissingKey(r, line);
         const auto position = std::uint32_t(read.size());
         KeyCache::Resolved resolved;
         std::string_view nameText, typeText;

@@ -195,37 +195,35 @@ bool MasterFS::isEncrypted() const {
     return false;
 }
 
-bool MasterFS::exists(std::string_view path) {
+namespace {
+
+// Whether one of 'list' answers 'probe' for the alias-expanded path. Probing
+// is routine (assimp asks for optional files), so no call stack is captured,
+// and a file system that cannot tell does not have the path.
+bool anyHas(const vector<MasterFS::Attached>& list, std::string_view path,
+            bool (IPlugin::*probe)(std::string_view)) {
     if (path.empty())
         return false;
-    string expanded = aliases().expand(path);
-    vector<Attached> list = attached();
+    const string expanded = aliases().expand(path);
     ScopedStackCapture noCapture(false);
-    for (const Attached& a : list) {
+    for (const MasterFS::Attached& a : list) {
         try {
-            if (a.plugin->exists(expanded))
+            if ((a.plugin.get()->*probe)(expanded))
                 return true;
         } catch (const exception&) {
-            // A file system that cannot tell does not have the file.
         }
     }
     return false;
 }
 
+} // namespace
+
+bool MasterFS::exists(std::string_view path) {
+    return anyHas(attached(), path, &IPlugin::exists);
+}
+
 bool MasterFS::isFolder(std::string_view path) {
-    if (path.empty())
-        return false;
-    string expanded = aliases().expand(path);
-    vector<Attached> list = attached();
-    ScopedStackCapture noCapture(false);
-    for (const Attached& a : list) {
-        try {
-            if (a.plugin->isFolder(expanded))
-                return true;
-        } catch (const exception&) {
-        }
-    }
-    return false;
+    return anyHas(attached(), path, &IPlugin::isFolder);
 }
 
 Stream MasterFS::open(std::string_view path, std::uint32_t flags) {
