@@ -108,6 +108,7 @@ void registerContainerTypes(AttribFactory& factory) {
 
 // ---- binary helpers -------------------------------------------------------------
 
+#pragma GCC visibility push(hidden)
 namespace attrib_map_detail {
 
 ReadDepth::ReadDepth() noexcept {
@@ -193,6 +194,7 @@ bool readSized(Stream& stream, Attribute& value, std::uint32_t bytes) {
 }
 
 } // namespace attrib_map_detail
+#pragma GCC visibility pop
 
 using namespace attrib_map_detail;
 

@@ -6,6 +6,8 @@
 #include <cstdint>
 #include <string_view>
 
+// Shared by the library's sources only: kept out of its exported symbols.
+#pragma GCC visibility push(hidden)
 namespace base::attrib_map_detail {
 
 // Nesting guard for container reads: a corrupt stream could otherwise nest maps
@@ -43,3 +45,4 @@ bool readSized(Stream& stream, Attribute& value, std::uint32_t bytes);
 bool fits(Stream& stream, std::uint64_t bytes);
 
 } // namespace base::attrib_map_detail
+#pragma GCC visibility pop

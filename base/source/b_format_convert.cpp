@@ -10,6 +10,7 @@
 #include <cstring>
 #include <iconv.h>
 
+#pragma GCC visibility push(hidden)
 namespace base::format_detail {
 namespace {
 
@@ -257,3 +258,4 @@ bool wideToNarrow(const char16_t* text, std::size_t n, std::uint32_t codePage,
 }
 
 } // namespace base::format_detail
+#pragma GCC visibility pop

@@ -8,6 +8,8 @@
 #include <cstdint>
 #include <string_view>
 
+// Shared by the library's sources only: kept out of its exported symbols.
+#pragma GCC visibility push(hidden)
 namespace base::format_detail {
 
 // Room for any numeric or time text: a 309-digit double with 100 decimals and
@@ -50,3 +52,4 @@ public:
 };
 
 } // namespace base::format_detail
+#pragma GCC visibility pop

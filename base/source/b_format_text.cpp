@@ -11,6 +11,7 @@
 #include <cstring>
 #include <ctime>
 
+#pragma GCC visibility push(hidden)
 namespace base::format_detail {
 namespace {
 
@@ -428,3 +429,4 @@ std::size_t formatValue(const FormatArg& arg, std::string_view style, const Form
 }
 
 } // namespace base::format_detail
+#pragma GCC visibility pop

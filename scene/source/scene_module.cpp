@@ -1,18 +1,32 @@
-#include "module_loader.h"
+#include "scene_module.h"
 
 #include "b_format.h"
 
 #include <dlfcn.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <climits>
+#include <cstdlib>
 
-namespace host {
+namespace scene {
 
 namespace {
 
 using LoadEntry = int (*)(base::PluginFactory&);
 using UnloadEntry = int (*)();
+
+bool isFile(const base::string& path) {
+    struct stat info;
+    return stat(path.c_str(), &info) == 0 && S_ISREG(info.st_mode);
+}
+
+// The folder part of a path, with its trailing slash; empty for a bare name.
+base::string folderOf(std::string_view path) {
+    const std::size_t slash = path.rfind('/');
+    return base::string(slash == std::string_view::npos ? std::string_view{}
+                                                        : path.substr(0, slash + 1));
+}
 
 } // namespace
 
@@ -24,16 +38,20 @@ ModuleLoader::~ModuleLoader() {
 }
 
 base::string ModuleLoader::defaultPath() {
+    if (const char* named = std::getenv(pathVariable); named && *named)
+        return named;
+    // This library's own file: the installed module lives below its folder.
+    Dl_info info{};
+    if (dladdr(reinterpret_cast<void*>(&ModuleLoader::defaultPath), &info) && info.dli_fname) {
+        base::string installed = folderOf(info.dli_fname) + "scene_assimp/plugins/scene_assimp.so";
+        if (isFile(installed))
+            return installed;
+    }
     char buffer[PATH_MAX];
     const ssize_t length = readlink("/proc/self/exe", buffer, sizeof buffer - 1);
     if (length <= 0)
         return "scene_assimp.so";
-    std::string_view exe(buffer, std::size_t(length));
-    const std::size_t slash = exe.rfind('/');
-    base::string path(slash == std::string_view::npos ? std::string_view{}
-                                                      : exe.substr(0, slash + 1));
-    path += "scene_assimp.so";
-    return path;
+    return folderOf(std::string_view(buffer, std::size_t(length))) + "scene_assimp.so";
 }
 
 bool ModuleLoader::load(std::string_view path, base::PluginFactory& factory, base::string& error) {
@@ -64,4 +82,4 @@ bool ModuleLoader::load(std::string_view path, base::PluginFactory& factory, bas
     return true;
 }
 
-} // namespace host
+} // namespace scene
