@@ -1,0 +1,276 @@
+#include "raster.h"
+
+#include <algorithm>
+#include <array>
+#include <cmath>
+
+namespace host::preview {
+
+namespace {
+
+constexpr float ambient = 0.25f;
+constexpr float diffuse = 0.75f;
+// Outline pixels keep this share of their colour.
+constexpr unsigned outlineShare = 77; // of 256
+
+bool finite(float x, float y, float z) noexcept {
+    return std::isfinite(x) && std::isfinite(y) && std::isfinite(z);
+}
+
+// Twice the signed area of (a, b, p); positive when p lies left of a->b in a
+// y-up frame, which on screen (y down) means right of it.
+double edge(double ax, double ay, double bx, double by, double px, double py) noexcept {
+    return (bx - ax) * (py - ay) - (by - ay) * (px - ax);
+}
+
+// Pixels exactly on an edge shared by two faces go to exactly one of them: the
+// one whose inside lies in the chosen half-plane of the edge's normal.
+bool ownsEdge(double ax, double ay, double bx, double by) noexcept {
+    const double nx = -(by - ay), ny = bx - ax;
+    return nx > 0 || (nx == 0 && ny > 0);
+}
+
+int clampPixel(double v, std::uint32_t limit) noexcept {
+    if (!(v > -1))
+        return -1;
+    if (v > double(limit))
+        return int(limit);
+    return int(v);
+}
+
+} // namespace
+
+std::uint8_t toSrgb8(float linear) noexcept {
+    // 4096 steps keep every 8-bit output reachable; the table is built once.
+    static const std::array<std::uint8_t, 4097> table = [] {
+        std::array<std::uint8_t, 4097> t{};
+        for (std::size_t i = 0; i < t.size(); ++i) {
+            const double l = double(i) / 4096.0;
+            const double s = l <= 0.0031308 ? 12.92 * l : 1.055 * std::pow(l, 1 / 2.4) - 0.055;
+            t[i] = std::uint8_t(std::lround(std::clamp(s, 0.0, 1.0) * 255));
+        }
+        return t;
+    }();
+    if (!(linear > 0))
+        return 0;
+    if (linear >= 1)
+        return 255;
+    return table[std::size_t(linear * 4096.0f + 0.5f)];
+}
+
+Raster::Raster(std::uint32_t width, std::uint32_t height, const View& view,
+               const base::vec3f& background)
+    : m_width(width), m_height(height), m_view(view),
+      m_light(base::vec3f{0.35f, 0.6f, 0.72f}.normalized()) {
+    const std::size_t count = std::size_t(width) * height;
+    m_rgb.resize(count * 3);
+    const std::uint8_t bg[3] = {toSrgb8(background.x), toSrgb8(background.y),
+                                toSrgb8(background.z)};
+    for (std::size_t i = 0; i < count; ++i)
+        std::copy(bg, bg + 3, m_rgb.data() + i * 3);
+    m_depth.assign(count, 0.0f);
+    m_object.assign(count, 0);
+}
+
+Raster::ScreenPoint Raster::toScreen(double x, double y, double depth) const noexcept {
+    return {0.5 * m_width + m_view.focal * x / depth, 0.5 * m_height - m_view.focal * y / depth,
+            1.0 / depth};
+}
+
+Raster::Vertex Raster::project(const base::vec3d& world) const noexcept {
+    const base::vec3d p = m_view.toCamera * (world - m_view.eye);
+    Vertex v{float(p.x), float(p.y), float(p.z), 0, 0, 0};
+    if (!finite(v.x, v.y, v.z)) {
+        v.z = NAN;
+        return v;
+    }
+    if (-double(v.z) >= m_view.nearDistance) {
+        const ScreenPoint s = toScreen(v.x, v.y, -double(v.z));
+        v.sx = float(s.x);
+        v.sy = float(s.y);
+        v.iz = float(s.iz);
+    }
+    return v;
+}
+
+void Raster::setVertices(std::span<const base::vec3f> positions, const base::mat43& toWorld) {
+    m_vertices.resize(positions.size());
+    for (std::size_t i = 0; i < positions.size(); ++i) {
+        const base::vec3f& p = positions[i];
+        m_vertices[i] = project(toWorld.transformPoint({p.x, p.y, p.z}));
+    }
+}
+
+void Raster::shade(const Vertex& a, const Vertex& b, const Vertex& c, const base::vec3f& color,
+                   std::uint8_t* rgb) const noexcept {
+    const base::vec3d ab{double(b.x) - a.x, double(b.y) - a.y, double(b.z) - a.z};
+    const base::vec3d ac{double(c.x) - a.x, double(c.y) - a.y, double(c.z) - a.z};
+    base::vec3d n{ab.y * ac.z - ab.z * ac.y, ab.z * ac.x - ab.x * ac.z, ab.x * ac.y - ab.y * ac.x};
+    // Seen from behind: light the side the camera sees.
+    if (n.x * a.x + n.y * a.y + n.z * a.z > 0)
+        n = -n;
+    const double length = n.length();
+    const double facing = (n.x * m_light.x + n.y * m_light.y + n.z * m_light.z) / length;
+    const float light = ambient + diffuse * float(std::max(0.0, facing));
+    rgb[0] = toSrgb8(color.x * light);
+    rgb[1] = toSrgb8(color.y * light);
+    rgb[2] = toSrgb8(color.z * light);
+}
+
+void Raster::triangle(std::uint32_t ia, std::uint32_t ib, std::uint32_t ic,
+                      const base::vec3f& color, std::uint32_t object) {
+    const std::size_t count = m_vertices.size();
+    if (ia >= count || ib >= count || ic >= count || object == 0) {
+        ++m_stats.skipped;
+        return;
+    }
+    const Vertex& a = m_vertices[ia];
+    const Vertex& b = m_vertices[ib];
+    const Vertex& c = m_vertices[ic];
+    if (std::isnan(a.z) || std::isnan(b.z) || std::isnan(c.z)) {
+        ++m_stats.skipped;
+        return;
+    }
+    const float limit = float(-m_view.nearDistance);
+    const int inFront = int(a.z <= limit) + int(b.z <= limit) + int(c.z <= limit);
+    if (inFront == 0) {
+        ++m_stats.skipped;
+        return;
+    }
+    // A face of zero area has no normal and covers no pixel.
+    const double cross = std::abs(edge(a.x, a.y, b.x, b.y, c.x, c.y)) +
+                         std::abs(edge(a.y, a.z, b.y, b.z, c.y, c.z)) +
+                         std::abs(edge(a.z, a.x, b.z, b.x, c.z, c.x));
+    if (!(cross > 0) || !std::isfinite(cross)) {
+        ++m_stats.skipped;
+        return;
+    }
+    std::uint8_t rgb[3];
+    shade(a, b, c, color, rgb);
+    ++m_stats.triangles;
+
+    if (inFront == 3) {
+        fill({a.sx, a.sy, a.iz}, {b.sx, b.sy, b.iz}, {c.sx, c.sy, c.iz}, rgb, object);
+        return;
+    }
+    // Cut the face at the near plane: one or two corners stay, giving a
+    // triangle or a quadrilateral.
+    const Vertex* corners[3] = {&a, &b, &c};
+    ScreenPoint polygon[4];
+    int n = 0;
+    for (int i = 0; i < 3; ++i) {
+        const Vertex& p = *corners[i];
+        const Vertex& q = *corners[(i + 1) % 3];
+        const bool pIn = p.z <= limit, qIn = q.z <= limit;
+        if (pIn)
+            polygon[n++] = {p.sx, p.sy, p.iz};
+        if (pIn != qIn) {
+            const double t = (double(limit) - p.z) / (double(q.z) - p.z);
+            polygon[n++] = toScreen(p.x + t * (double(q.x) - p.x), p.y + t * (double(q.y) - p.y),
+                                    -double(limit));
+        }
+    }
+    for (int i = 1; i + 1 < n; ++i)
+        fill(polygon[0], polygon[i], polygon[i + 1], rgb, object);
+}
+
+void Raster::fill(ScreenPoint a, ScreenPoint b, ScreenPoint c, const std::uint8_t* rgb,
+                  std::uint32_t object) {
+    double area = edge(a.x, a.y, b.x, b.y, c.x, c.y);
+    if (area < 0) {
+        std::swap(b, c);
+        area = -area;
+    }
+    if (!(area > 0) || !std::isfinite(area))
+        return;
+    const int x0 = std::max(0, clampPixel(std::ceil(std::min({a.x, b.x, c.x}) - 0.5), m_width));
+    const int x1 = std::min(int(m_width) - 1,
+                            clampPixel(std::floor(std::max({a.x, b.x, c.x}) - 0.5), m_width));
+    const int y0 = std::max(0, clampPixel(std::ceil(std::min({a.y, b.y, c.y}) - 0.5), m_height));
+    const int y1 = std::min(int(m_height) - 1,
+                            clampPixel(std::floor(std::max({a.y, b.y, c.y}) - 0.5), m_height));
+    if (x0 > x1 || y0 > y1)
+        return;
+
+    // Edge i is the one opposite corner i; its function is that corner's weight.
+    const ScreenPoint* from[3] = {&b, &c, &a};
+    const ScreenPoint* to[3] = {&c, &a, &b};
+    double stepX[3], stepY[3], start[3];
+    bool owns[3];
+    const double px = x0 + 0.5, py = y0 + 0.5;
+    for (int i = 0; i < 3; ++i) {
+        stepX[i] = -(to[i]->y - from[i]->y);
+        stepY[i] = to[i]->x - from[i]->x;
+        start[i] = edge(from[i]->x, from[i]->y, to[i]->x, to[i]->y, px, py);
+        owns[i] = ownsEdge(from[i]->x, from[i]->y, to[i]->x, to[i]->y);
+    }
+    const double za = a.iz / area, zb = b.iz / area, zc = c.iz / area;
+
+    m_stats.pixelsTested += std::uint64_t(x1 - x0 + 1) * std::uint64_t(y1 - y0 + 1);
+    for (int y = y0; y <= y1; ++y) {
+        const double dy = y - y0;
+        double w0 = start[0] + dy * stepY[0];
+        double w1 = start[1] + dy * stepY[1];
+        double w2 = start[2] + dy * stepY[2];
+        std::size_t index = std::size_t(y) * m_width + std::size_t(x0);
+        for (int x = x0; x <= x1; ++x, ++index, w0 += stepX[0], w1 += stepX[1], w2 += stepX[2]) {
+            if ((w0 < 0 || (w0 == 0 && !owns[0])) || (w1 < 0 || (w1 == 0 && !owns[1])) ||
+                (w2 < 0 || (w2 == 0 && !owns[2])))
+                continue;
+            const float iz = float(w0 * za + w1 * zb + w2 * zc);
+            if (!(iz > m_depth[index]))
+                continue;
+            m_depth[index] = iz;
+            m_object[index] = object;
+            std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
+            ++m_stats.pixelsWritten;
+        }
+    }
+}
+
+void Raster::dot(const base::vec3d& world, int radius, const base::vec3f& color,
+                 std::uint32_t object) {
+    const Vertex v = project(world);
+    if (object == 0 || std::isnan(v.z) || -double(v.z) < m_view.nearDistance)
+        return;
+    const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
+    const int cx = clampPixel(std::floor(v.sx), m_width),
+              cy = clampPixel(std::floor(v.sy), m_height);
+    for (int y = std::max(0, cy - radius); y <= std::min(int(m_height) - 1, cy + radius); ++y)
+        for (int x = std::max(0, cx - radius); x <= std::min(int(m_width) - 1, cx + radius); ++x) {
+            const std::size_t index = std::size_t(y) * m_width + std::size_t(x);
+            if (!(v.iz > m_depth[index]))
+                continue;
+            m_depth[index] = v.iz;
+            m_object[index] = object;
+            std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
+        }
+}
+
+void Raster::finish() {
+    // An outline pixel is a covered one beside the background, or beside a
+    // nearer object: one pixel wide, on the far side of each contour.
+    base::vector<std::uint32_t> outline;
+    for (std::uint32_t y = 0; y < m_height; ++y)
+        for (std::uint32_t x = 0; x < m_width; ++x) {
+            const std::size_t index = std::size_t(y) * m_width + x;
+            const std::uint32_t object = m_object[index];
+            if (!object)
+                continue;
+            auto differs = [&](std::size_t other) {
+                return m_object[other] != object &&
+                       (m_object[other] == 0 || m_depth[other] > m_depth[index]);
+            };
+            if ((x > 0 && differs(index - 1)) || (x + 1 < m_width && differs(index + 1)) ||
+                (y > 0 && differs(index - m_width)) ||
+                (y + 1 < m_height && differs(index + m_width)))
+                outline.push_back(std::uint32_t(index));
+        }
+    for (std::uint32_t index : outline)
+        for (int k = 0; k < 3; ++k) {
+            std::uint8_t& channel = m_rgb[std::size_t(index) * 3 + k];
+            channel = std::uint8_t(channel * outlineShare / 256);
+        }
+}
+
+} // namespace host::preview
