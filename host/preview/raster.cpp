@@ -176,51 +176,94 @@ void Raster::triangle(std::uint32_t ia, std::uint32_t ib, std::uint32_t ic,
 
 void Raster::fill(ScreenPoint a, ScreenPoint b, ScreenPoint c, const std::uint8_t* rgb,
                   std::uint32_t object) {
-    double area = edge(a.x, a.y, b.x, b.y, c.x, c.y);
+    double iz[3] = {a.iz, b.iz, c.iz};
+    const ScreenPoint* corners[3] = {&a, &b, &c};
+    // Snapped to 1/256 pixel, edge functions are exact integers, so faces that
+    // share an edge neither overlap nor leave a crack. Corners far outside the
+    // image (big faces cut at the near plane) would overflow: doubles then.
+    constexpr double snapLimit = double(1 << 20);
+    bool snap = true;
+    for (const ScreenPoint* p : corners)
+        snap = snap && std::abs(p->x) < snapLimit && std::abs(p->y) < snapLimit;
+    if (snap) {
+        std::int64_t x[3], y[3];
+        for (int k = 0; k < 3; ++k) {
+            x[k] = std::llround(corners[k]->x * 256);
+            y[k] = std::llround(corners[k]->y * 256);
+        }
+        scan<std::int64_t>(x, y, iz, 256, rgb, object);
+    } else {
+        double x[3] = {a.x, b.x, c.x}, y[3] = {a.y, b.y, c.y};
+        scan<double>(x, y, iz, 1, rgb, object);
+    }
+}
+
+template <class T>
+void Raster::scan(T (&x)[3], T (&y)[3], double (&iz)[3], T one, const std::uint8_t* rgb,
+                  std::uint32_t object) {
+    auto edgeOf = [](T ax, T ay, T bx, T by, T px, T py) {
+        return (bx - ax) * (py - ay) - (by - ay) * (px - ax);
+    };
+    T area = edgeOf(x[0], y[0], x[1], y[1], x[2], y[2]);
     if (area < 0) {
-        std::swap(b, c);
+        std::swap(x[1], x[2]);
+        std::swap(y[1], y[2]);
+        std::swap(iz[1], iz[2]);
         area = -area;
     }
-    if (!(area > 0) || !std::isfinite(area))
+    if (!(area > 0) || !std::isfinite(double(area)))
         return;
-    const int x0 = std::max(0, clampPixel(std::ceil(std::min({a.x, b.x, c.x}) - 0.5), m_width));
-    const int x1 = std::min(int(m_width) - 1,
-                            clampPixel(std::floor(std::max({a.x, b.x, c.x}) - 0.5), m_width));
-    const int y0 = std::max(0, clampPixel(std::ceil(std::min({a.y, b.y, c.y}) - 0.5), m_height));
-    const int y1 = std::min(int(m_height) - 1,
-                            clampPixel(std::floor(std::max({a.y, b.y, c.y}) - 0.5), m_height));
+    // Pixel k's centre lies at k * one + half.
+    const T half = one / 2;
+    auto first = [&](const T(&v)[3], std::uint32_t limit) {
+        return std::max(0,
+                        clampPixel(std::ceil((double(std::min({v[0], v[1], v[2]})) - double(half)) /
+                                             double(one)),
+                                   limit));
+    };
+    auto last = [&](const T(&v)[3], std::uint32_t limit) {
+        return std::min(
+            int(limit) - 1,
+            clampPixel(
+                std::floor((double(std::max({v[0], v[1], v[2]})) - double(half)) / double(one)),
+                limit));
+    };
+    const int x0 = first(x, m_width), x1 = last(x, m_width);
+    const int y0 = first(y, m_height), y1 = last(y, m_height);
     if (x0 > x1 || y0 > y1)
         return;
 
     // Edge i is the one opposite corner i; its function is that corner's weight.
-    const ScreenPoint* from[3] = {&b, &c, &a};
-    const ScreenPoint* to[3] = {&c, &a, &b};
-    double stepX[3], stepY[3], start[3];
+    static constexpr int from[3] = {1, 2, 0}, to[3] = {2, 0, 1};
+    T stepX[3], stepY[3], start[3];
     bool owns[3];
-    const double px = x0 + 0.5, py = y0 + 0.5;
+    const T px = T(x0) * one + half, py = T(y0) * one + half;
     for (int i = 0; i < 3; ++i) {
-        stepX[i] = -(to[i]->y - from[i]->y);
-        stepY[i] = to[i]->x - from[i]->x;
-        start[i] = edge(from[i]->x, from[i]->y, to[i]->x, to[i]->y, px, py);
-        owns[i] = ownsEdge(from[i]->x, from[i]->y, to[i]->x, to[i]->y);
+        const int f = from[i], t = to[i];
+        stepX[i] = -(y[t] - y[f]) * one;
+        stepY[i] = (x[t] - x[f]) * one;
+        start[i] = edgeOf(x[f], y[f], x[t], y[t], px, py);
+        owns[i] = ownsEdge(double(x[f]), double(y[f]), double(x[t]), double(y[t]));
     }
-    const double za = a.iz / area, zb = b.iz / area, zc = c.iz / area;
+    const double scale = 1 / double(area);
+    const double za = iz[0] * scale, zb = iz[1] * scale, zc = iz[2] * scale;
 
     m_stats.pixelsTested += std::uint64_t(x1 - x0 + 1) * std::uint64_t(y1 - y0 + 1);
-    for (int y = y0; y <= y1; ++y) {
-        const double dy = y - y0;
-        double w0 = start[0] + dy * stepY[0];
-        double w1 = start[1] + dy * stepY[1];
-        double w2 = start[2] + dy * stepY[2];
-        std::size_t index = std::size_t(y) * m_width + std::size_t(x0);
-        for (int x = x0; x <= x1; ++x, ++index, w0 += stepX[0], w1 += stepX[1], w2 += stepX[2]) {
+    for (int row = y0; row <= y1; ++row) {
+        const T dy = T(row - y0);
+        T w0 = start[0] + dy * stepY[0];
+        T w1 = start[1] + dy * stepY[1];
+        T w2 = start[2] + dy * stepY[2];
+        std::size_t index = std::size_t(row) * m_width + std::size_t(x0);
+        for (int col = x0; col <= x1;
+             ++col, ++index, w0 += stepX[0], w1 += stepX[1], w2 += stepX[2]) {
             if ((w0 < 0 || (w0 == 0 && !owns[0])) || (w1 < 0 || (w1 == 0 && !owns[1])) ||
                 (w2 < 0 || (w2 == 0 && !owns[2])))
                 continue;
-            const float iz = float(w0 * za + w1 * zb + w2 * zc);
-            if (!(iz > m_depth[index]))
+            const float depth = float(double(w0) * za + double(w1) * zb + double(w2) * zc);
+            if (!(depth > m_depth[index]))
                 continue;
-            m_depth[index] = iz;
+            m_depth[index] = depth;
             m_object[index] = object;
             std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
             ++m_stats.pixelsWritten;

@@ -81,6 +81,10 @@ private:
     ScreenPoint toScreen(double x, double y, double depth) const noexcept;
     void fill(ScreenPoint a, ScreenPoint b, ScreenPoint c, const std::uint8_t* rgb,
               std::uint32_t object);
+    // Corner coordinates in units of 1/'one' pixel.
+    template <class T>
+    void scan(T (&x)[3], T (&y)[3], double (&iz)[3], T one, const std::uint8_t* rgb,
+              std::uint32_t object);
     void shade(const Vertex& a, const Vertex& b, const Vertex& c, const base::vec3f& color,
                std::uint8_t* rgb) const noexcept;
 
