@@ -251,7 +251,7 @@ int run(int argc, char** argv, HostLog& hostLog) {
     }
     const bool toStdout = output && *output == "-";
     host::preview::PreviewRequest preview;
-    if (!host::preview::readSwitches(switches.preview, preview, error))
+    if (!host::preview::readSwitches(switches.preview, model, preview, error))
         return usageError(error);
     const bool wantSummary =
         switches.summary->isSet() ? switches.summary->value() : output == nullptr;

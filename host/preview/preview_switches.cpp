@@ -18,7 +18,8 @@ PreviewSwitches registerSwitches(base::CmdLineOptions& options) {
     return s;
 }
 
-bool readSwitches(const PreviewSwitches& switches, PreviewRequest& request, base::string& error) {
+bool readSwitches(const PreviewSwitches& switches, const base::string& model,
+                  PreviewRequest& request, base::string& error) {
     request = {};
     if (!switches.output->isSet()) {
         if (switches.size->isSet() || switches.camera->isSet()) {
@@ -42,6 +43,8 @@ bool readSwitches(const PreviewSwitches& switches, PreviewRequest& request, base
         request.options.size = std::uint32_t(size);
     }
     request.options.sceneCamera = switches.camera->isSet() && switches.camera->value();
+    const std::size_t slash = model.find_last_of('/');
+    request.options.modelFolder = slash == base::string::npos ? "./" : model.substr(0, slash + 1);
     return true;
 }
 

@@ -19,9 +19,10 @@ struct PreviewRequest {
     PreviewOptions options;
 };
 
-// The request the parsed switches make; false with a usage message when
+// The request the parsed switches make for 'model'; false with a usage message when
 // --size or --preview-camera come without --preview, the path is empty or
 // the size is out of range.
-bool readSwitches(const PreviewSwitches& switches, PreviewRequest& request, base::string& error);
+bool readSwitches(const PreviewSwitches& switches, const base::string& model,
+                  PreviewRequest& request, base::string& error);
 
 } // namespace host::preview

@@ -213,7 +213,8 @@ View chooseView(const IPlugin& sceneObject, const SceneContent& content,
 // no tint.
 class TintCache {
 public:
-    explicit TintCache(const base::PluginFactory& factory) : m_factory(factory) {}
+    TintCache(const base::PluginFactory& factory, const base::string& modelFolder)
+        : m_folders{modelFolder, factory.name()} {}
 
     vec3f tint(const IPlugin& texture) {
         auto [slot, fresh] = m_tints.try_emplace(&texture, vec3f{1, 1, 1});
@@ -263,23 +264,26 @@ private:
         const base::string* file = texture.findAttribute<base::string>(names::file);
         if (!file || file->empty())
             return {1, 1, 1};
-        base::string path = *file;
-        if (path.front() != '/')
-            path = base::string(m_factory.name()) + path;
-        try {
-            base::Stream stream = base::fs::master().open(path, base::fs::openRead);
-            const std::uint64_t size = stream.getSize();
-            if (size > maxTextureBytes)
-                return {1, 1, 1};
-            base::vector<std::uint8_t> bytes(size);
-            bytes.resize(stream.read(bytes.data(), size));
-            return meanOfPng(bytes);
-        } catch (const base::exception&) {
-            return {1, 1, 1}; // an unreadable texture only loses its tint
+        for (const base::string& folder : m_folders) {
+            if (file->front() != '/' && folder.empty())
+                continue;
+            const base::string path = file->front() == '/' ? *file : folder + *file;
+            try {
+                base::Stream stream = base::fs::master().open(path, base::fs::openRead);
+                const std::uint64_t size = stream.getSize();
+                if (size > maxTextureBytes)
+                    return {1, 1, 1};
+                base::vector<std::uint8_t> bytes(size);
+                bytes.resize(stream.read(bytes.data(), size));
+                return meanOfPng(bytes);
+            } catch (const base::exception&) {
+                // Not there: an unreadable texture only loses its tint.
+            }
         }
+        return {1, 1, 1};
     }
 
-    const base::PluginFactory& m_factory;
+    base::string m_folders[2];
     std::unordered_map<const IPlugin*, vec3f> m_tints;
 };
 
@@ -382,7 +386,7 @@ RgbImage renderPreview(const base::PluginFactory& factory, const IPlugin& sceneO
     const SceneContent content = walkScene(sceneObject);
     Raster raster(options.size, options.size, chooseView(sceneObject, content, options),
                   background);
-    TintCache tints(factory);
+    TintCache tints(factory, options.modelFolder);
     std::uint32_t object = 0;
 
     // Instances of one mesh are drawn together, so coded indices are decoded

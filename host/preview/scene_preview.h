@@ -24,6 +24,9 @@ struct PreviewOptions {
     // Look through the scene's first camera; without a usable one the framed
     // view is taken and a warning logged.
     bool sceneCamera = false;
+    // Texture files named by a relative path are looked for in this folder
+    // (the model's, ending in '/'), then in the factory's.
+    base::string modelFolder;
 };
 
 // Accepted image sizes.

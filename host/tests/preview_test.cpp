@@ -191,6 +191,13 @@ TEST(Raster, TenMillionFacesInBoundedTimeAndMemory) {
 
 // ---- Scenes built in memory ----
 
+PreviewOptions sized(std::uint32_t size, bool sceneCamera = false) {
+    PreviewOptions options;
+    options.size = size;
+    options.sceneCamera = sceneCamera;
+    return options;
+}
+
 class ScenePreview : public ::testing::Test {
 protected:
     base::CaptureLog log;
@@ -235,9 +242,11 @@ protected:
             m->setAttribute(names::colorMap, colorMap);
         return m;
     }
-    RgbImage render(PreviewOptions options = {128, false}) {
+    RgbImage render(PreviewOptions options = sized(128)) {
+        options.modelFolder = modelFolder;
         return renderPreview(*factory, *sceneObject, options);
     }
+    base::string modelFolder;
 };
 
 // Every pixel that is not background, with the background taken from a corner.
@@ -263,6 +272,17 @@ TEST_F(ScenePreview, PrimitivesTakeTheirMaterialColour) {
         << error;
     PluginRef missing = make("fileTexture");
     missing->setAttribute(names::file, base::string("nowhere.png"));
+    // A file beside the model, named relative to it.
+    const auto folder = std::filesystem::temp_directory_path() /
+                        ("scene_preview_tint_" + std::to_string(::getpid()));
+    std::filesystem::create_directories(folder);
+    modelFolder = folder.string() + "/";
+    base::vector<std::uint8_t> redPng;
+    ASSERT_TRUE(encodePng(RgbImage{1, 1, {200, 0, 0}}, redPng, error));
+    std::ofstream(folder / "red.png", std::ios::binary)
+        .write(reinterpret_cast<const char*>(redPng.data()), std::streamsize(redPng.size()));
+    PluginRef beside = make("fileTexture");
+    beside->setAttribute(names::file, base::string("red.png"));
 
     struct Case {
         const char* what;
@@ -274,6 +294,7 @@ TEST_F(ScenePreview, PrimitivesTakeTheirMaterialColour) {
                           {"no material", {}, -1},
                           {"raw blue map", {material({1, 1, 1}, raw)}, 2},
                           {"png green map", {material({1, 1, 1}, packed)}, 1},
+                          {"png file map", {material({1, 1, 1}, beside)}, 0},
                           {"unreadable map", {material({0.8f, 0.8f, 0.8f}, missing)}, -1}};
     for (const Case& c : cases) {
         root->removeAttribute(names::children);
@@ -289,6 +310,7 @@ TEST_F(ScenePreview, PrimitivesTakeTheirMaterialColour) {
                 EXPECT_EQ(p[k] > 0, k == c.channel) << c.what << " channel " << k;
         }
     }
+    std::filesystem::remove_all(folder);
 }
 
 // Skins draw their base mesh; coded indices draw what plain ones do; a node
@@ -317,11 +339,11 @@ TEST_F(ScenePreview, SceneCameraOrFramedView) {
     adopt(*node(*root, {0, 0, 0}), quadMesh());
     PluginRef eye = node(*root, {0, 0, 10});
     const RgbImage framed = render();
-    EXPECT_EQ(render({128, true}).rgb, framed.rgb);
+    EXPECT_EQ(render(sized(128, true)).rgb, framed.rgb);
     EXPECT_EQ(log.messages().size(), 1u);
 
     adopt(*eye, make("camera"));
-    const RgbImage seen = render({128, true});
+    const RgbImage seen = render(sized(128, true));
     std::size_t count = 0;
     double sx = 0, sy = 0;
     for (std::uint32_t i = 0; i < 128 * 128; ++i)
@@ -427,7 +449,7 @@ TEST(SamplePreview, SilhouetteMatchesItsProjection) {
             sceneObject = p.get();
     ASSERT_TRUE(sceneObject);
 
-    const View view = previewView(*sceneObject, {256, false});
+    const View view = previewView(*sceneObject, sized(256));
     std::vector<bool> expected(256 * 256, false);
     projectNode(view, *sceneObject->findAttribute<PluginRef>(names::root)->get(), mat43::identity(),
                 256, expected);
