@@ -31,7 +31,7 @@ struct PreviewOptions {
 
 // Accepted image sizes.
 constexpr std::uint32_t minPreviewSize = 16;
-constexpr std::uint32_t maxPreviewSize = 8192;
+constexpr std::uint32_t maxPreviewSize = 4096;
 
 // The view a preview of 'scene' is rendered with.
 View previewView(const base::IPlugin& scene, const PreviewOptions& options);

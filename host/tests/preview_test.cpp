@@ -13,6 +13,7 @@
 #include "stream/b_fs.h"
 
 #include <gtest/gtest.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
@@ -422,6 +423,36 @@ void projectNode(const View& view, const IPlugin& node, const mat43& parent, std
             project(view, corners, size, mask);
         }
     }
+}
+
+// Exit codes of the preview switches: usage errors (2) are found before the
+// import, a file that cannot be written fails the run (1).
+TEST(SamplePreview, SwitchesAndExitCodes) {
+    const auto dir = std::filesystem::temp_directory_path() /
+                     ("scene_preview_cli_" + std::to_string(::getpid()));
+    std::filesystem::create_directories(dir);
+    const std::string png = "'" + (dir / "p.png").string() + "'";
+    struct Case {
+        std::string args;
+        int code;
+        bool written;
+    };
+    const Case cases[] = {{"--preview " + png + " --size 16 --preview-camera", 0, true},
+                          {"--preview " + png + " --size 15", 2, false},
+                          {"--preview " + png + " --size 4097", 2, false},
+                          {"--size 64", 2, false},
+                          {"--preview-camera", 2, false},
+                          {"--preview ''", 2, false},
+                          {"--preview '" + (dir / "no" / "p.png").string() + "'", 1, false}};
+    for (const Case& c : cases) {
+        std::filesystem::remove(dir / "p.png");
+        const std::string command = std::string("'" SCENE_IMPORT_EXE "' -q --summary false '") +
+                                    SCENE_SAMPLES_DIR + "/sample.gltf' " + c.args + " 2>/dev/null";
+        const int status = std::system(command.c_str());
+        EXPECT_EQ(WIFEXITED(status) ? WEXITSTATUS(status) : -1, c.code) << c.args;
+        EXPECT_EQ(std::filesystem::exists(dir / "p.png"), c.written) << c.args;
+    }
+    std::filesystem::remove_all(dir);
 }
 
 TEST(SamplePreview, SilhouetteMatchesItsProjection) {
