@@ -12,6 +12,8 @@ constexpr float ambient = 0.25f;
 constexpr float diffuse = 0.75f;
 // Outline pixels keep this share of their colour.
 constexpr unsigned outlineShare = 77; // of 256
+// Marks the objects of points and lines, which take no outline.
+constexpr std::uint32_t thinObject = 0x80000000u;
 
 bool finite(float x, float y, float z) noexcept {
     return std::isfinite(x) && std::isfinite(y) && std::isfinite(z);
@@ -271,6 +273,17 @@ void Raster::scan(T (&x)[3], T (&y)[3], double (&iz)[3], T one, const std::uint8
     }
 }
 
+void Raster::plot(std::uint32_t x, std::uint32_t y, float depth, const std::uint8_t* rgb,
+                  std::uint32_t object) {
+    const std::size_t index = std::size_t(y) * m_width + x;
+    if (!(depth > m_depth[index]))
+        return;
+    m_depth[index] = depth;
+    m_object[index] = object;
+    std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
+    ++m_stats.pixelsWritten;
+}
+
 void Raster::dot(const base::vec3d& world, int radius, const base::vec3f& color,
                  std::uint32_t object) {
     const Vertex v = project(world);
@@ -280,14 +293,85 @@ void Raster::dot(const base::vec3d& world, int radius, const base::vec3f& color,
     const int cx = clampPixel(std::floor(v.sx), m_width),
               cy = clampPixel(std::floor(v.sy), m_height);
     for (int y = std::max(0, cy - radius); y <= std::min(int(m_height) - 1, cy + radius); ++y)
-        for (int x = std::max(0, cx - radius); x <= std::min(int(m_width) - 1, cx + radius); ++x) {
-            const std::size_t index = std::size_t(y) * m_width + std::size_t(x);
-            if (!(v.iz > m_depth[index]))
+        for (int x = std::max(0, cx - radius); x <= std::min(int(m_width) - 1, cx + radius); ++x)
+            plot(std::uint32_t(x), std::uint32_t(y), v.iz, rgb, object);
+}
+
+void Raster::point(std::uint32_t a, const base::vec3f& color, std::uint32_t object) {
+    if (a >= m_vertices.size() || object == 0) {
+        ++m_stats.skipped;
+        return;
+    }
+    const Vertex& v = m_vertices[a];
+    if (std::isnan(v.z) || -double(v.z) < m_view.nearDistance || !(v.sx >= 0) || !(v.sy >= 0) ||
+        v.sx >= float(m_width) || v.sy >= float(m_height)) {
+        ++m_stats.skipped;
+        return;
+    }
+    const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
+    plot(std::uint32_t(v.sx), std::uint32_t(v.sy), v.iz, rgb, object | thinObject);
+}
+
+void Raster::line(std::uint32_t ia, std::uint32_t ib, const base::vec3f& color,
+                  std::uint32_t object) {
+    const std::size_t count = m_vertices.size();
+    if (ia >= count || ib >= count || object == 0) {
+        ++m_stats.skipped;
+        return;
+    }
+    const Vertex& a = m_vertices[ia];
+    const Vertex& b = m_vertices[ib];
+    const float limit = float(-m_view.nearDistance);
+    const bool aIn = a.z <= limit, bIn = b.z <= limit;
+    if (std::isnan(a.z) || std::isnan(b.z) || (!aIn && !bIn)) {
+        ++m_stats.skipped;
+        return;
+    }
+    const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
+    auto cut = [&](const Vertex& in, const Vertex& out) {
+        const double t = (double(limit) - in.z) / (double(out.z) - in.z);
+        return toScreen(in.x + t * (double(out.x) - in.x), in.y + t * (double(out.y) - in.y),
+                        -double(limit));
+    };
+    const ScreenPoint sa = aIn ? ScreenPoint{a.sx, a.sy, a.iz} : cut(b, a);
+    const ScreenPoint sb = bIn ? ScreenPoint{b.sx, b.sy, b.iz} : cut(a, b);
+    segment(sa, sb, rgb, object | thinObject);
+}
+
+void Raster::segment(ScreenPoint a, ScreenPoint b, const std::uint8_t* rgb, std::uint32_t object) {
+    // Each end outside the image is moved back to the border along the
+    // segment, computed from the other end: an end far away cannot swamp the
+    // result, and a segment across the image costs no more than its width.
+    const double limits[2] = {double(m_width), double(m_height)};
+    auto at = [](const ScreenPoint& p, int axis) { return axis ? p.y : p.x; };
+    for (int axis = 0; axis < 2; ++axis)
+        for (const double bound : {0.0, limits[axis]}) {
+            auto outside = [&](const ScreenPoint& p) {
+                return bound == 0 ? at(p, axis) < 0 : at(p, axis) > bound;
+            };
+            const bool aOut = outside(a), bOut = outside(b);
+            if (aOut && bOut)
+                return;
+            if (!aOut && !bOut)
                 continue;
-            m_depth[index] = v.iz;
-            m_object[index] = object;
-            std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
+            ScreenPoint& p = aOut ? a : b;
+            const ScreenPoint& q = aOut ? b : a;
+            const double r = (bound - at(q, axis)) / (at(p, axis) - at(q, axis));
+            p = {q.x + (p.x - q.x) * r, q.y + (p.y - q.y) * r, q.iz + (p.iz - q.iz) * r};
+            (axis ? p.y : p.x) = bound;
         }
+    const double dx = b.x - a.x, dy = b.y - a.y;
+    const double steps = std::ceil(std::max(std::abs(dx), std::abs(dy)));
+    if (!std::isfinite(steps) || !std::isfinite(a.iz + b.iz))
+        return;
+    const int n = int(std::min(steps, limits[0] + limits[1]));
+    for (int i = 0; i <= n; ++i) {
+        const double t = n ? double(i) / n : 0;
+        const double x = a.x + dx * t, y = a.y + dy * t;
+        if (!(x >= 0 && y >= 0 && x < limits[0] && y < limits[1]))
+            continue;
+        plot(std::uint32_t(x), std::uint32_t(y), float(a.iz + (b.iz - a.iz) * t), rgb, object);
+    }
 }
 
 void Raster::finish() {
@@ -298,7 +382,7 @@ void Raster::finish() {
         for (std::uint32_t x = 0; x < m_width; ++x) {
             const std::size_t index = std::size_t(y) * m_width + x;
             const std::uint32_t object = m_object[index];
-            if (!object)
+            if (!object || (object & thinObject))
                 continue;
             auto differs = [&](std::size_t other) {
                 return m_object[other] != object &&

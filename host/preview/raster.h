@@ -55,6 +55,10 @@ public:
     // 'object' tells objects apart for the outline (0 is reserved).
     void triangle(std::uint32_t a, std::uint32_t b, std::uint32_t c, const base::vec3f& color,
                   std::uint32_t object);
+    // Points and line segments of the current vertices, one pixel wide and
+    // unlit; they get no outline of their own.
+    void point(std::uint32_t a, const base::vec3f& color, std::uint32_t object);
+    void line(std::uint32_t a, std::uint32_t b, const base::vec3f& color, std::uint32_t object);
     // A square dot of 'radius' pixels around a world point, depth-tested.
     void dot(const base::vec3d& world, int radius, const base::vec3f& color, std::uint32_t object);
     // Darkens the outline pixels; call once after drawing.
@@ -87,6 +91,10 @@ private:
               std::uint32_t object);
     void shade(const Vertex& a, const Vertex& b, const Vertex& c, const base::vec3f& color,
                std::uint8_t* rgb) const noexcept;
+    // Writes one pixel when 'depth' is nearer than what it holds.
+    void plot(std::uint32_t x, std::uint32_t y, float depth, const std::uint8_t* rgb,
+              std::uint32_t object);
+    void segment(ScreenPoint a, ScreenPoint b, const std::uint8_t* rgb, std::uint32_t object);
 
     std::uint32_t m_width, m_height;
     View m_view;

@@ -329,11 +329,15 @@ FaceSizes faceSizes(const base::AttribMap& primitive) {
     return sizes;
 }
 
-// Faces of 'sizes' over indices[begin, end): polygons as fans, points and
-// lines left out. A face that would run past the range ends the primitive.
+// Faces of 'sizes' over indices[begin, end): polygons as fans, then lines
+// and points. A face that would run past the range ends the primitive.
 void drawFaces(Raster& raster, std::span<const std::uint32_t> indices, std::size_t begin,
                std::size_t end, const FaceSizes& sizes, const vec3f& color, std::uint32_t object) {
     auto face = [&](std::size_t at, std::size_t corners) {
+        if (corners == 1)
+            raster.point(indices[at], color, object);
+        else if (corners == 2)
+            raster.line(indices[at], indices[at + 1], color, object);
         for (std::size_t k = 1; k + 1 < corners; ++k)
             raster.triangle(indices[at], indices[at + k], indices[at + k + 1], color, object);
     };

@@ -159,6 +159,45 @@ TEST(Raster, BadFacesDrawNothingAndClippedFacesStayInPlace) {
             EXPECT_FALSE(floor.covered(x, y)) << x << "," << y;
 }
 
+// Points and lines keep their colour (no outline), cut at the near plane and
+// at the image's border, whatever their length.
+TEST(Raster, PointsAndLines) {
+    Raster raster(64, 64, straightView(), black);
+    raster.setVertices(std::vector<vec3f>{{-1, 0.01f, -4},
+                                          {1, 0.01f, -4},
+                                          {0, 0.5f, -4},
+                                          {0, 0.5f, 4},
+                                          {1e30f, -0.5f, -4},
+                                          {0, -0.5f, -4},
+                                          {0.5f, 0.25f, 10},
+                                          {0.5f, 0.25f, -100}},
+                       mat43::identity());
+    raster.line(0, 1, red, 1); // row 31, columns 16 to 48
+    raster.point(2, red, 2);   // (32, 24)
+    raster.point(3, red, 3);   // behind the eye
+    raster.point(9, red, 4);   // no such vertex
+    raster.line(4, 5, red, 5); // row 40, from column 32 to the border
+    raster.line(6, 7, red, 6); // from behind the eye to far ahead
+    raster.line(3, 6, red, 7); // wholly behind
+    raster.finish();
+    std::vector<std::pair<std::uint32_t, std::uint32_t>> expected;
+    for (std::uint32_t x = 16; x <= 48; ++x)
+        expected.push_back({x, 31});
+    expected.push_back({32, 24});
+    for (std::uint32_t x = 32; x < 64; ++x)
+        expected.push_back({x, 40});
+    for (const auto& [x, y] : expected) {
+        ASSERT_TRUE(raster.covered(x, y)) << x << "," << y;
+        EXPECT_EQ(pixel(raster, x, y)[0], 255) << x << "," << y;
+    }
+    // The last line runs from the image's edge towards (32.3, 31.8).
+    const std::size_t others = coveredCount(raster) - expected.size();
+    EXPECT_GT(others, 0u);
+    EXPECT_LT(others, 64u);
+    EXPECT_TRUE(raster.covered(32, 31));
+    EXPECT_EQ(raster.stats().skipped, 3u);
+}
+
 // Ten million faces: drawing allocates nothing and tests few pixels per face.
 TEST(Raster, TenMillionFacesInBoundedTimeAndMemory) {
     constexpr std::uint32_t side = 1001, repeats = 5;
