@@ -8,25 +8,13 @@
 # TRIANGLES (default "1000000 4000000"), SKIP_BUILD=1 to reuse the build.
 set -euo pipefail
 
-root=$(cd "$(dirname "$0")/.." && pwd)
-build="$root/build/bench-release"
 reps=${REPS:-3}
 formats=${FORMATS:-"ply"}
 size=${SIZE:-512}
 triangles=${TRIANGLES:-"1000000 4000000"}
 
-if [[ "${SKIP_BUILD:-0}" != 1 ]]; then
-    cmake -S "$root" -B "$build" -DCMAKE_BUILD_TYPE=Release -DSCENE_BENCH=ON \
-        -DSCENE_SANITIZE=OFF -DSCENE_TESTS=OFF >/dev/null
-    cmake --build "$build" -j2 --target make_grid_model import_case scene_assimp >/dev/null
-fi
-generate="$build/bench/make_grid_model"
-run="$build/bench/import_case"
-models="$build/bench-models"
-mkdir -p "$models"
-
-median() { sort -g | awk '{ v[NR] = $1 } END { print (NR % 2) ? v[(NR + 1) / 2] : (v[NR / 2] + v[NR / 2 + 1]) / 2 }'; }
-field() { sed -n "s/.* $1=\([^ ]*\).*/\1/p"; }
+# shellcheck source=bench_common.sh
+source "$(dirname "$0")/bench_common.sh"
 
 printf '%-22s %6s %10s %11s %9s %9s\n' model size import_s preview_s ratio peak_MiB
 for count in $triangles; do

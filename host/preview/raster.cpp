@@ -262,20 +262,12 @@ void Raster::scan(T (&x)[3], T (&y)[3], double (&iz)[3], T one, const std::uint8
             if ((w0 < 0 || (w0 == 0 && !owns[0])) || (w1 < 0 || (w1 == 0 && !owns[1])) ||
                 (w2 < 0 || (w2 == 0 && !owns[2])))
                 continue;
-            const float depth = float(double(w0) * za + double(w1) * zb + double(w2) * zc);
-            if (!(depth > m_depth[index]))
-                continue;
-            m_depth[index] = depth;
-            m_object[index] = object;
-            std::copy(rgb, rgb + 3, m_rgb.data() + index * 3);
-            ++m_stats.pixelsWritten;
+            plotAt(index, float(double(w0) * za + double(w1) * zb + double(w2) * zc), rgb, object);
         }
     }
 }
 
-void Raster::plot(std::uint32_t x, std::uint32_t y, float depth, const std::uint8_t* rgb,
-                  std::uint32_t object) {
-    const std::size_t index = std::size_t(y) * m_width + x;
+void Raster::plotAt(std::size_t index, float depth, const std::uint8_t* rgb, std::uint32_t object) {
     if (!(depth > m_depth[index]))
         return;
     m_depth[index] = depth;
@@ -294,7 +286,7 @@ void Raster::dot(const base::vec3d& world, int radius, const base::vec3f& color,
               cy = clampPixel(std::floor(v.sy), m_height);
     for (int y = std::max(0, cy - radius); y <= std::min(int(m_height) - 1, cy + radius); ++y)
         for (int x = std::max(0, cx - radius); x <= std::min(int(m_width) - 1, cx + radius); ++x)
-            plot(std::uint32_t(x), std::uint32_t(y), v.iz, rgb, object);
+            plotAt(std::size_t(y) * m_width + std::size_t(x), v.iz, rgb, object);
 }
 
 void Raster::point(std::uint32_t a, const base::vec3f& color, std::uint32_t object) {
@@ -309,7 +301,7 @@ void Raster::point(std::uint32_t a, const base::vec3f& color, std::uint32_t obje
         return;
     }
     const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
-    plot(std::uint32_t(v.sx), std::uint32_t(v.sy), v.iz, rgb, object | thinObject);
+    plotAt(std::size_t(v.sy) * m_width + std::size_t(v.sx), v.iz, rgb, object | thinObject);
 }
 
 void Raster::line(std::uint32_t ia, std::uint32_t ib, const base::vec3f& color,
@@ -370,7 +362,8 @@ void Raster::segment(ScreenPoint a, ScreenPoint b, const std::uint8_t* rgb, std:
         const double x = a.x + dx * t, y = a.y + dy * t;
         if (!(x >= 0 && y >= 0 && x < limits[0] && y < limits[1]))
             continue;
-        plot(std::uint32_t(x), std::uint32_t(y), float(a.iz + (b.iz - a.iz) * t), rgb, object);
+        plotAt(std::size_t(y) * m_width + std::size_t(x), float(a.iz + (b.iz - a.iz) * t), rgb,
+               object);
     }
 }
 

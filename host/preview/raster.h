@@ -91,9 +91,8 @@ private:
               std::uint32_t object);
     void shade(const Vertex& a, const Vertex& b, const Vertex& c, const base::vec3f& color,
                std::uint8_t* rgb) const noexcept;
-    // Writes one pixel when 'depth' is nearer than what it holds.
-    void plot(std::uint32_t x, std::uint32_t y, float depth, const std::uint8_t* rgb,
-              std::uint32_t object);
+    // Writes pixel 'index' when 'depth' is nearer than what it holds.
+    void plotAt(std::size_t index, float depth, const std::uint8_t* rgb, std::uint32_t object);
     void segment(ScreenPoint a, ScreenPoint b, const std::uint8_t* rgb, std::uint32_t object);
 
     std::uint32_t m_width, m_height;
