@@ -372,30 +372,58 @@ TEST_F(ScenePreview, SkinsCodedIndicesAndCycles) {
     EXPECT_EQ(render().rgb, plain.rgb);
 }
 
-// A camera 10 units in front of the quad sees it centred, 64 / 0.36 pixels
-// per unit at distance 10 (sensor 36, focal length 50); without a camera the
-// framed view is taken and a warning says so.
+// A camera 10 units from the quad, looking at it from either side or through
+// a scaled parent, sees it centred, 64 / 0.36 pixels per unit at distance 10
+// (sensor 36, focal length 50). Without a usable camera the framed view is
+// taken and a warning says so.
 TEST_F(ScenePreview, SceneCameraOrFramedView) {
     adopt(*node(*root, {0, 0, 0}), quadMesh());
-    PluginRef eye = node(*root, {0, 0, 10});
     const RgbImage framed = render();
     EXPECT_EQ(render(sized(128, true)).rgb, framed.rgb);
     EXPECT_EQ(log.messages().size(), 1u);
 
-    adopt(*eye, make("camera"));
-    const RgbImage seen = render(sized(128, true));
-    std::size_t count = 0;
-    double sx = 0, sy = 0;
-    for (std::uint32_t i = 0; i < 128 * 128; ++i)
-        if (seen.rgb[i * 3] != seen.rgb[0]) {
-            ++count;
-            sx += i % 128 + 0.5;
-            sy += i / 128 + 0.5;
+    struct Case {
+        const char* what;
+        vec3d parentScale, translate;
+        base::quatf rotate; // w, x, y, z
+        float focalLength;
+    };
+    const Case cases[] = {{"in front", {1, 1, 1}, {0, 0, 10}, {1, 0, 0, 0}, 50},
+                          {"behind, turned", {1, 1, 1}, {0, 0, -10}, {0, 0, 1, 0}, 50},
+                          {"scaled parent", {2, 2, 2}, {0, 0, 5}, {1, 0, 0, 0}, 50},
+                          {"no focal length", {1, 1, 1}, {0, 0, 10}, {1, 0, 0, 0}, 0}};
+    for (const Case& c : cases) {
+        root->removeAttribute(names::children);
+        adopt(*node(*root, {0, 0, 0}), quadMesh());
+        PluginRef parent = node(*root, {0, 0, 0});
+        parent->setAttribute(names::scale, vec3f{float(c.parentScale.x), float(c.parentScale.y),
+                                                 float(c.parentScale.z)});
+        PluginRef eye = node(*parent, c.translate);
+        eye->setAttribute(names::rotate, c.rotate);
+        PluginRef camera = make("camera");
+        camera->setAttribute(names::focalLength, c.focalLength);
+        adopt(*eye, camera);
+        log.clear();
+        const RgbImage seen = render(sized(128, true));
+        if (c.focalLength == 0) {
+            EXPECT_EQ(seen.rgb, framed.rgb) << c.what;
+            EXPECT_EQ(log.messages().size(), 1u) << c.what;
+            continue;
         }
-    const double side = 64 / 0.36 / 10;
-    EXPECT_NEAR(double(count), side * side, 4 * side + 4);
-    EXPECT_NEAR(sx / count, 64, 0.5);
-    EXPECT_NEAR(sy / count, 64, 0.5);
+        std::size_t count = 0;
+        double sx = 0, sy = 0;
+        for (std::uint32_t i = 0; i < 128 * 128; ++i)
+            if (seen.rgb[i * 3] != seen.rgb[0]) {
+                ++count;
+                sx += i % 128 + 0.5;
+                sy += i / 128 + 0.5;
+            }
+        const double side = 64 / 0.36 / 10;
+        ASSERT_GT(count, 0u) << c.what;
+        EXPECT_NEAR(double(count), side * side, 4 * side + 4) << c.what;
+        EXPECT_NEAR(sx / count, 64, 0.5) << c.what;
+        EXPECT_NEAR(sy / count, 64, 0.5) << c.what;
+    }
 }
 
 TEST_F(ScenePreview, SceneWithoutGeometryShowsNodeDots) {
