@@ -282,6 +282,10 @@ void Raster::dot(const base::vec3d& world, int radius, const base::vec3f& color,
     if (object == 0 || std::isnan(v.z) || -double(v.z) < m_view.nearDistance)
         return;
     const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
+    square(v, radius, rgb, object);
+}
+
+void Raster::square(const Vertex& v, int radius, const std::uint8_t* rgb, std::uint32_t object) {
     const int cx = clampPixel(std::floor(v.sx), m_width),
               cy = clampPixel(std::floor(v.sy), m_height);
     for (int y = std::max(0, cy - radius); y <= std::min(int(m_height) - 1, cy + radius); ++y)
@@ -301,7 +305,8 @@ void Raster::point(std::uint32_t a, const base::vec3f& color, std::uint32_t obje
         return;
     }
     const std::uint8_t rgb[3] = {toSrgb8(color.x), toSrgb8(color.y), toSrgb8(color.z)};
-    plotAt(std::size_t(v.sy) * m_width + std::size_t(v.sx), v.iz, rgb, object | thinObject);
+    // A single pixel is hard to see in a large image.
+    square(v, std::min(m_width, m_height) >= 256 ? 1 : 0, rgb, object | thinObject);
 }
 
 void Raster::line(std::uint32_t ia, std::uint32_t ib, const base::vec3f& color,

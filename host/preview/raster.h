@@ -55,8 +55,8 @@ public:
     // 'object' tells objects apart for the outline (0 is reserved).
     void triangle(std::uint32_t a, std::uint32_t b, std::uint32_t c, const base::vec3f& color,
                   std::uint32_t object);
-    // Points and line segments of the current vertices, one pixel wide and
-    // unlit; they get no outline of their own.
+    // Points and line segments of the current vertices, one pixel wide (points
+    // three in images of 256 pixels or more) and unlit; they get no outline.
     void point(std::uint32_t a, const base::vec3f& color, std::uint32_t object);
     void line(std::uint32_t a, std::uint32_t b, const base::vec3f& color, std::uint32_t object);
     // A square dot of 'radius' pixels around a world point, depth-tested.
@@ -91,6 +91,8 @@ private:
               std::uint32_t object);
     void shade(const Vertex& a, const Vertex& b, const Vertex& c, const base::vec3f& color,
                std::uint8_t* rgb) const noexcept;
+    // The pixels within 'radius' of a projected vertex.
+    void square(const Vertex& v, int radius, const std::uint8_t* rgb, std::uint32_t object);
     // Writes pixel 'index' when 'depth' is nearer than what it holds.
     void plotAt(std::size_t index, float depth, const std::uint8_t* rgb, std::uint32_t object);
     void segment(ScreenPoint a, ScreenPoint b, const std::uint8_t* rgb, std::uint32_t object);

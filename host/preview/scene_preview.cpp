@@ -180,8 +180,9 @@ bool cameraView(const IPlugin& camera, const mat43& world, std::uint32_t size, d
 
 View chooseView(const IPlugin& sceneObject, const SceneContent& content,
                 const PreviewOptions& options) {
+    // Meshes without a finite position are framed like a scene without any.
     base::box3d frame = content.meshBounds;
-    if (content.meshes.empty())
+    if (frame.isEmpty())
         for (const vec3d& p : content.nodes)
             frame.extend(p);
     const std::uint8_t upAxis = SCENE_GET(sceneObject, scene::scene_schema, upAxis);
@@ -357,10 +358,20 @@ void drawFaces(Raster& raster, std::span<const std::uint32_t> indices, std::size
 void drawMesh(Raster& raster, const IPlugin& mesh, std::span<const std::uint32_t> indices,
               const mat43& world, std::uint32_t object, TintCache& tints) {
     const auto* positions = mesh.findVecAttribute<vec3f>(names::positions);
-    if (!positions || positions->empty() || indices.empty())
+    if (!positions || positions->empty())
         return;
     raster.setVertices({positions->data(), positions->size()}, world);
     const base::AttribArray* primitives = mesh.findArray(names::primitives);
+    if (indices.empty()) {
+        // A point cloud: vertices without faces, in the first primitive's colour.
+        base::Attribute* first =
+            primitives && primitives->size() ? primitives->items().front() : nullptr;
+        const base::AttribMap* primitive = first ? first->asMap() : nullptr;
+        const vec3f color = primitive ? primitiveColor(*primitive, tints) : grey;
+        for (std::uint32_t i = 0; i < positions->size(); ++i)
+            raster.point(i, color, object);
+        return;
+    }
     if (!primitives) {
         drawFaces(raster, indices, 0, indices.size(), FaceSizes{3, nullptr}, grey, object);
         return;
@@ -415,7 +426,9 @@ RgbImage renderPreview(const base::PluginFactory& factory, const IPlugin& sceneO
         for (std::size_t i : byMesh[mesh])
             drawMesh(raster, *mesh, indices, content.meshes[i].world, ++object, tints);
     }
-    if (content.meshes.empty()) {
+    // Nothing drawn (no meshes, or none with a visible face): the nodes show
+    // where the scene's content is.
+    if (raster.stats().pixelsWritten == 0) {
         const int radius = int(std::max<std::uint32_t>(2, options.size / 128));
         for (const vec3d& p : content.nodes)
             raster.dot(p, radius, dotColor, ++object);

@@ -3,8 +3,10 @@
 // pose), coloured by the "color" of its primitive's first material (grey
 // without one, tinted by the mean colour of a readable PNG "colorMap"), seen
 // from the front-right-top diagonal of the scene's up axis so that the whole
-// scene fits, or through the scene's first camera. A scene without geometry
-// shows its node positions as dots.
+// scene fits, or through the scene's first camera. Faces are lit and
+// outlined; the points and lines of meshes, and the vertices of meshes
+// without faces, are drawn one pixel wide. When nothing can be drawn (no
+// geometry, or none with a finite visible face) the nodes show as dots.
 //
 // The scene is only read; the images are written as PNG files.
 #pragma once

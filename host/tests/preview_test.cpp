@@ -426,12 +426,24 @@ TEST_F(ScenePreview, SceneCameraOrFramedView) {
     }
 }
 
-TEST_F(ScenePreview, SceneWithoutGeometryShowsNodeDots) {
+// Without a face to draw, the nodes show as dots: no geometry at all, or only
+// NaN positions. A mesh of vertices without faces shows them as points.
+TEST_F(ScenePreview, NodeDotsAndPointClouds) {
     node(*root, {-1, 0, 0});
     node(*node(*root, {1, 0, 0}), {0, 1, 0});
-    const auto pixels = foreground(render());
     // Four nodes (the root too), dots of 5 x 5 pixels, none hiding another.
-    EXPECT_EQ(pixels.size(), 4u * 25u);
+    EXPECT_EQ(foreground(render()).size(), 4u * 25u);
+
+    const float nan = std::nanf("");
+    PluginRef broken = quadMesh();
+    broken->vecAttribute<vec3f>(names::positions)->items().assign(4, vec3f{nan, nan, nan});
+    adopt(*root, broken);
+    EXPECT_EQ(foreground(render()).size(), 4u * 25u);
+
+    PluginRef cloud = make("mesh");
+    cloud->vecAttribute<vec3f>(names::positions)->items() = {{-1, 0, 0}, {0, 0, 0}, {1, 0, 0}};
+    adopt(*root, cloud);
+    EXPECT_EQ(foreground(render()).size(), 3u);
 }
 
 // ---- The sample model end to end ----
