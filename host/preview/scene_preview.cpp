@@ -62,14 +62,17 @@ bool isNode(const IPlugin& plugin) {
     return scene::query<scene::IHierarchical>(plugin);
 }
 
-void addMesh(SceneContent& content, const IPlugin& mesh, const mat43& world) {
+// Each mesh's own box, asked once however many nodes use the mesh.
+using MeshBoxes = std::unordered_map<const IPlugin*, base::box3d>;
+
+void addMesh(SceneContent& content, MeshBoxes& boxes, const IPlugin& mesh, const mat43& world) {
     content.meshes.push_back({&mesh, world});
-    if (auto* bounded = scene::query<scene::IBounded>(mesh)) {
-        // Mode 1 answers a stored box as it is; the importer stores one.
-        base::box3d box;
-        bounded->computeBounds(box, 1, false);
-        content.meshBounds.unite(box.transformed(world));
-    }
+    auto [slot, fresh] = boxes.try_emplace(&mesh, base::box3d::empty());
+    if (fresh)
+        if (auto* bounded = scene::query<scene::IBounded>(mesh))
+            // Mode 1 answers a stored box as it is; the importer stores one.
+            bounded->computeBounds(slot->second, 1, false);
+    content.meshBounds.unite(slot->second.transformed(world));
 }
 
 // Depth first, without recursion (imported hierarchies can be very deep); a
@@ -88,6 +91,7 @@ SceneContent walkScene(const IPlugin& sceneObject) {
     };
     base::vector<Frame> stack;
     std::unordered_set<const IPlugin*> onPath;
+    MeshBoxes boxes;
     auto enter = [&](const IPlugin& node, const mat43& parent) {
         if (!SCENE_GET(node, scene::node_schema, visible) || onPath.count(&node))
             return;
@@ -112,11 +116,11 @@ SceneContent walkScene(const IPlugin& sceneObject) {
             continue;
         const base::name_id type = child->className();
         if (type == names::mesh) {
-            addMesh(content, *child, frame.world);
+            addMesh(content, boxes, *child, frame.world);
         } else if (type == names::skin) {
             const IPlugin* base = pluginOf(*child, names::baseMesh);
             if (base && base->className() == names::mesh)
-                addMesh(content, *base, frame.world);
+                addMesh(content, boxes, *base, frame.world);
         } else if (type == names::camera) {
             content.cameras.push_back({child, frame.world});
         } else if (isNode(*child)) {
