@@ -13,21 +13,12 @@
 # TRIANGLES (default "1000000 4000000"), SKIP_BUILD=1 to reuse the build.
 set -euo pipefail
 
-root=$(cd "$(dirname "$0")/.." && pwd)
-build="$root/build/bench-release"
 reps=${REPS:-3}
 formats=${FORMATS:-"ply glb"}
 triangles=${TRIANGLES:-"1000000 4000000"}
 
-if [[ "${SKIP_BUILD:-0}" != 1 ]]; then
-    cmake -S "$root" -B "$build" -DCMAKE_BUILD_TYPE=Release -DSCENE_BENCH=ON \
-        -DSCENE_SANITIZE=OFF -DSCENE_TESTS=OFF >/dev/null
-    cmake --build "$build" -j2 --target make_grid_model import_case scene_assimp >/dev/null
-fi
-generate="$build/bench/make_grid_model"
-run="$build/bench/import_case"
-models="$build/bench-models"
-mkdir -p "$models"
+# shellcheck source=bench_common.sh
+source "$(dirname "$0")/bench_common.sh"
 json="$models/out.json"
 trap 'rm -f "$json"' EXIT
 
@@ -38,9 +29,6 @@ if ! grep -q '"positions^' "$json"; then
     echo "run_import_bench: the import wrote no mesh positions; is the mesh conversion built?" >&2
     exit 1
 fi
-
-median() { sort -g | awk '{ v[NR] = $1 } END { print (NR % 2) ? v[(NR + 1) / 2] : (v[NR / 2] + v[NR / 2 + 1]) / 2 }'; }
-field() { sed -n "s/.* $1=\([^ ]*\).*/\1/p"; }
 
 printf '%-22s %-7s %9s %9s %10s %7s %7s %7s\n' model case wall_s cpu_s peak_MiB wall/a cpu/a mem/a
 for count in $triangles; do

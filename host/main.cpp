@@ -10,6 +10,7 @@
 #include "b_json.h"
 #include "b_log.h"
 #include "module_loader.h"
+#include "preview_switches.h"
 #include "scene_cmdline.h"
 #include "scene_importer.h"
 #include "scene_interfaces.h"
@@ -47,6 +48,7 @@ struct HostSwitches {
     base::CmdLineValue<bool>* quiet = nullptr;
     base::CmdLineValue<bool>* flipTextureCoordinates = nullptr;
     base::CmdLineValue<bool>* flipFaceWinding = nullptr;
+    host::preview::PreviewSwitches preview;
 };
 
 HostSwitches registerSwitches(base::CmdLineOptions& options) {
@@ -77,6 +79,7 @@ HostSwitches registerSwitches(base::CmdLineOptions& options) {
         "Whether to flip the texture coordinates vertically (v becomes 1 - v).");
     s.flipFaceWinding = options.addValue<bool>(
         "-importFlipFaceWinding", {}, "Whether to reverse the vertex order of every face.");
+    s.preview = host::preview::registerSwitches(options);
     return s;
 }
 
@@ -247,6 +250,9 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return usageError("-o needs a file name or '-'");
     }
     const bool toStdout = output && *output == "-";
+    host::preview::PreviewRequest preview;
+    if (!host::preview::readSwitches(switches.preview, model, preview, error))
+        return usageError(error);
     const bool wantSummary =
         switches.summary->isSet() ? switches.summary->value() : output == nullptr;
 
@@ -342,6 +348,15 @@ int run(int argc, char** argv, HostLog& hostLog) {
         stream.close();
         if (!written)
             return failure(base::format("writing '{}' failed", toStdout ? "<stdout>" : *output));
+    }
+
+    if (!preview.path.empty()) {
+        const base::IPlugin* sceneObject = newestOfType(*factory, scene::names::scene);
+        if (!sceneObject)
+            return failure(base::format("'{}' gave no scene to preview", model));
+        if (!host::preview::writePreview(*factory, *sceneObject, preview.path, preview.options,
+                                         error))
+            return failure(error);
     }
 
     if (wantSummary) {

@@ -4,7 +4,8 @@
 set -euo pipefail
 
 packages=(cmake g++ make libassimp-dev assimp-utils assimp-testmodels rapidjson-dev
-          libpugixml-dev googletest libgtest-dev libbenchmark-dev pkgconf python3)
+          libpugixml-dev googletest libgtest-dev libbenchmark-dev pkgconf python3
+          libpng-dev)
 
 missing=()
 for p in "${packages[@]}"; do

@@ -6,8 +6,11 @@
 //   import  the whole import: scene types, module load, importer creation,
 //           option defaults, import into a factory
 //   json    the whole import, then the factory written as JSON to a file
+//   preview the whole import, then a preview image of the scene written as
+//           PNG (--preview OUT, default <model>.png); its time is printed apart
 //
-//   import_case <read|import|json> <model> [--module PATH] [--json OUT] [--trace MS]
+//   import_case <read|import|json|preview> <model> [--module PATH] [--json OUT]
+//               [--preview OUT] [--size N] [--trace MS]
 //
 // Output, one line: "<case> seconds=<wall> cpu=<user+sys> peak_kib=<VmHWM> ..."
 // then counts that show what was read (assimp's vertices and faces, or the
@@ -20,6 +23,8 @@
 #include "b_plugin_factory.h"
 #include "scene_importer.h"
 #include "scene_interfaces.h"
+#include "scene_preview.h"
+#include "scene_schema.h"
 #include "stream/b_fs.h"
 
 #include <assimp/Importer.hpp>
@@ -143,9 +148,14 @@ void runRead(const std::string& model, int tracePeriod) {
                 seconds, cpu, peak, scene->mNumMeshes, vertices, faces);
 }
 
-// Cases "import" and "json".
+struct PreviewCase {
+    std::string path; // empty: no preview
+    std::uint32_t size = 512;
+};
+
+// Cases "import", "json" and "preview".
 void runImport(const std::string& model, const std::string& modulePath, const std::string& json,
-               int tracePeriod) {
+               int tracePeriod, const PreviewCase& preview = {}) {
     using LoadEntry = int (*)(base::PluginFactory&);
     using UnloadEntry = int (*)();
 
@@ -154,7 +164,7 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     void* module = nullptr;
     UnloadEntry unload = nullptr;
     std::size_t objects = 0, meshes = 0;
-    double seconds = 0, cpu = 0, importSeconds = 0;
+    double seconds = 0, cpu = 0, importSeconds = 0, previewSeconds = 0;
     long peak = 0;
     {
         base::ref<base::PluginFactory> factory(new base::PluginFactory("bench"));
@@ -186,6 +196,25 @@ void runImport(const std::string& model, const std::string& modulePath, const st
             fail("the import of '" + model + "' failed");
         importSeconds = since(importStart);
 
+        if (!preview.path.empty()) {
+            trace.mark("preview");
+            const base::IPlugin* sceneObject = nullptr;
+            for (std::uint32_t id = 0; id < factory->pluginCount(); ++id)
+                if (base::ref<base::IPlugin> object = factory->plugin(id);
+                    object && object->className() == scene::names::scene)
+                    sceneObject = object.get();
+            if (!sceneObject)
+                fail("the import made no scene");
+            const Clock::time_point previewStart = Clock::now();
+            base::string error;
+            host::preview::PreviewOptions options;
+            options.size = preview.size;
+            if (!host::preview::writePreview(*factory, *sceneObject, base::string(preview.path),
+                                             options, error))
+                fail(std::string(error));
+            previewSeconds = since(previewStart);
+        }
+
         if (!json.empty()) {
             trace.mark("json");
             base::Stream stream = base::fs::master().open(
@@ -207,9 +236,12 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     }
     unload();
     dlclose(module);
-    std::printf(
-        "%s seconds=%.4f cpu=%.4f peak_kib=%ld objects=%zu meshes=%zu import_seconds=%.4f\n",
-        json.empty() ? "import" : "json", seconds, cpu, peak, objects, meshes, importSeconds);
+    std::printf("%s seconds=%.4f cpu=%.4f peak_kib=%ld objects=%zu meshes=%zu import_seconds=%.4f "
+                "preview_seconds=%.4f\n",
+                !preview.path.empty() ? "preview"
+                : json.empty()        ? "import"
+                                      : "json",
+                seconds, cpu, peak, objects, meshes, importSeconds, previewSeconds);
 }
 
 } // namespace
@@ -217,13 +249,14 @@ void runImport(const std::string& model, const std::string& modulePath, const st
 int main(int argc, char** argv) {
     if (argc < 3) {
         std::fprintf(stderr,
-                     "usage: %s <read|import|json> <model> [--module PATH] [--json OUT] "
-                     "[--trace MS]\n",
+                     "usage: %s <read|import|json|preview> <model> [--module PATH] "
+                     "[--json OUT] [--preview OUT] [--size N] [--trace MS]\n",
                      argv[0]);
         return 2;
     }
     const std::string which = argv[1], model = argv[2];
     std::string modulePath = SCENE_ASSIMP_MODULE, json;
+    PreviewCase preview;
     int tracePeriod = 0;
     for (int i = 3; i + 1 < argc; i += 2) {
         const std::string option = argv[i];
@@ -231,6 +264,10 @@ int main(int argc, char** argv) {
             modulePath = argv[i + 1];
         else if (option == "--json")
             json = argv[i + 1];
+        else if (option == "--preview")
+            preview.path = argv[i + 1];
+        else if (option == "--size")
+            preview.size = std::uint32_t(std::atoi(argv[i + 1]));
         else if (option == "--trace")
             tracePeriod = std::atoi(argv[i + 1]);
         else
@@ -244,7 +281,11 @@ int main(int argc, char** argv) {
             runRead(model, tracePeriod);
         else if (which == "import")
             runImport(model, modulePath, {}, tracePeriod);
-        else if (which == "json")
+        else if (which == "preview") {
+            if (preview.path.empty())
+                preview.path = model + ".png";
+            runImport(model, modulePath, {}, tracePeriod, preview);
+        } else if (which == "json")
             runImport(model, modulePath, json.empty() ? model + ".json" : json, tracePeriod);
         else
             fail("unknown case '" + which + "'");
