@@ -9,6 +9,7 @@
 #include "b_format.h"
 #include "b_json.h"
 #include "b_log.h"
+#include "listing.h"
 #include "module_loader.h"
 #include "scene_cmdline.h"
 #include "scene_importer.h"
@@ -47,6 +48,7 @@ struct HostSwitches {
     base::CmdLineValue<bool>* quiet = nullptr;
     base::CmdLineValue<bool>* flipTextureCoordinates = nullptr;
     base::CmdLineValue<bool>* flipFaceWinding = nullptr;
+    base::CmdLineValue<base::string>* list = nullptr;
 };
 
 HostSwitches registerSwitches(base::CmdLineOptions& options) {
@@ -77,6 +79,10 @@ HostSwitches registerSwitches(base::CmdLineOptions& options) {
         "Whether to flip the texture coordinates vertically (v becomes 1 - v).");
     s.flipFaceWinding = options.addValue<bool>(
         "-importFlipFaceWinding", {}, "Whether to reverse the vertex order of every face.");
+    s.list = options.addValue<base::string>(
+        "--list", {},
+        "Print one line per camera or light (cameras, lights or cameras,lights): name, node path, "
+        "world position and view direction, lens or light values.");
     return s;
 }
 
@@ -247,8 +253,11 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return usageError("-o needs a file name or '-'");
     }
     const bool toStdout = output && *output == "-";
+    base::vector<host::ListKind> listed;
+    if (switches.list->isSet() && !host::parseListKinds(switches.list->value(), listed, error))
+        return usageError(error);
     const bool wantSummary =
-        switches.summary->isSet() ? switches.summary->value() : output == nullptr;
+        switches.summary->isSet() ? switches.summary->value() : !output && listed.empty();
 
     // Option values that do not fit their attribute are usage errors; find
     // them before the import rather than after it.
@@ -344,6 +353,10 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return failure(base::format("writing '{}' failed", toStdout ? "<stdout>" : *output));
     }
 
+    if (!listed.empty()) {
+        const base::string text = host::formatListing(*factory, listed);
+        std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
+    }
     if (wantSummary) {
         const base::string text = host::formatSummary(host::collectStats(*factory), seconds);
         std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
