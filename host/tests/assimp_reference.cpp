@@ -325,20 +325,23 @@ void checkFrame(const aiScene& scene, const Listed* listed, const char* kind, co
 }
 
 int checkCamerasAndLights(const char* model, const char* listingPath, const aiScene& scene) {
-    const std::vector<Listed> listed = readListing(listingPath);
+    // Each kind in its source order; the listing prints cameras first.
+    std::vector<Listed> listedCameras, listedLights;
+    for (Listed& entry : readListing(listingPath))
+        (entry.kind == "camera" ? listedCameras : listedLights).push_back(std::move(entry));
     std::string problems;
-    std::size_t next = 0, lights = 0, cameras = 0;
-    auto take = [&]() { return next < listed.size() ? &listed[next++] : nullptr; };
+    std::size_t lights = 0, cameras = 0;
+    auto at = [](const std::vector<Listed>& list, std::size_t i) {
+        return i < list.size() ? &list[i] : nullptr;
+    };
     for (unsigned i = 0; scene.mLights && i < scene.mNumLights; ++i)
         if (const aiLight* light = scene.mLights[i]) {
-            ++lights;
-            checkFrame(scene, take(), "light", light->mName, light->mPosition, light->mDirection,
-                       problems);
+            checkFrame(scene, at(listedLights, lights++), "light", light->mName, light->mPosition,
+                       light->mDirection, problems);
         }
     const bool gltf = isGltf(model);
     for (unsigned i = 0; scene.mCameras && i < scene.mNumCameras; ++i)
         if (const aiCamera* camera = scene.mCameras[i]) {
-            ++cameras;
             aiVector3D position = camera->mPosition;
             // The glTF reader repeats the node's translation in the camera.
             const aiNode* node =
@@ -347,10 +350,12 @@ int checkCamerasAndLights(const char* model, const char* listingPath, const aiSc
                 position == aiVector3D(node->mTransformation.a4, node->mTransformation.b4,
                                        node->mTransformation.c4))
                 position = aiVector3D();
-            checkFrame(scene, take(), "camera", camera->mName, position, camera->mLookAt, problems);
+            checkFrame(scene, at(listedCameras, cameras++), "camera", camera->mName, position,
+                       camera->mLookAt, problems);
         }
-    if (next < listed.size())
-        problems += "; " + std::to_string(listed.size() - next) + " more listed than assimp has";
+    if (listedCameras.size() + listedLights.size() != cameras + lights)
+        problems += "; " + std::to_string(listedCameras.size()) + " cameras and " +
+                    std::to_string(listedLights.size()) + " lights listed";
     std::printf("frames: cameras %zu lights %zu%s\n", cameras, lights,
                 problems.empty() ? " match" : problems.c_str());
     return problems.empty() ? 0 : 6;
