@@ -59,6 +59,20 @@ std::size_t childCount(const scene::INode& node) {
     return children ? children->size() : 0;
 }
 
+// A camera or light named 'name', appended to the children of its carrier.
+template <class I>
+base::ref<I> createCarried(base::PluginFactory& factory, base::name_id type,
+                           const base::string& name, scene::INode* carrier) {
+    base::ref<base::IPlugin> object = factory.create(type, createFlags);
+    base::ref<I> made(dynamic_cast<I*>(object.get()));
+    if (!made)
+        return made;
+    made->setAttribute(scene::names::name, name);
+    if (carrier)
+        carrier->appendAttributeItem(N::children(), Children(made.get()));
+    return made;
+}
+
 base::string stem(const aiString& name, const char* fallback) {
     return name.length ? base::string(name.C_Str()) : base::string(fallback);
 }
@@ -175,13 +189,10 @@ base::ref<scene::ICamera> AssimpImporter::importCamera(const aiScene* scene,
         placeObject(scene, source->mName, position, checked.vector(source->mLookAt),
                     checked.vector(source->mUp));
 
-    base::ref<base::IPlugin> object = m_factory->create(C::type(), createFlags);
-    base::ref<scene::ICamera> camera(dynamic_cast<scene::ICamera*>(object.get()));
+    base::ref<scene::ICamera> camera = createCarried<scene::ICamera>(
+        *m_factory, C::type(), freshName(stem(source->mName, "camera")), carrier.get());
     if (!camera)
         return camera;
-    camera->setAttribute(C::name(), freshName(stem(source->mName, "camera")));
-    if (carrier)
-        carrier->appendAttributeItem(N::children(), Children(camera.get()));
 
     base::vec2f sensor = C::sensorDefault();
     if (checked.finite({source->mAspect}) && source->mAspect != 0) {
@@ -218,13 +229,10 @@ base::ref<scene::ILight> AssimpImporter::importLight(const aiScene* scene, const
         placeObject(scene, source->mName, checked.vector(source->mPosition),
                     checked.vector(source->mDirection), checked.vector(source->mUp));
 
-    base::ref<base::IPlugin> object = m_factory->create(L::type(), createFlags);
-    base::ref<scene::ILight> light(dynamic_cast<scene::ILight*>(object.get()));
+    base::ref<scene::ILight> light = createCarried<scene::ILight>(
+        *m_factory, L::type(), freshName(stem(source->mName, "light")), carrier.get());
     if (!light)
         return light;
-    light->setAttribute(L::name(), freshName(stem(source->mName, "light")));
-    if (carrier)
-        carrier->appendAttributeItem(N::children(), Children(light.get()));
 
     switch (source->mType) {
     case aiLightSource_DIRECTIONAL:
