@@ -9,6 +9,7 @@
 #include "b_format.h"
 #include "b_json.h"
 #include "b_log.h"
+#include "listing.h"
 #include "module_loader.h"
 #include "preview_switches.h"
 #include "scene_cmdline.h"
@@ -49,6 +50,7 @@ struct HostSwitches {
     base::CmdLineValue<bool>* flipTextureCoordinates = nullptr;
     base::CmdLineValue<bool>* flipFaceWinding = nullptr;
     host::preview::PreviewSwitches preview;
+    base::CmdLineValue<base::string>* list = nullptr;
 };
 
 HostSwitches registerSwitches(base::CmdLineOptions& options) {
@@ -80,6 +82,10 @@ HostSwitches registerSwitches(base::CmdLineOptions& options) {
     s.flipFaceWinding = options.addValue<bool>(
         "-importFlipFaceWinding", {}, "Whether to reverse the vertex order of every face.");
     s.preview = host::preview::registerSwitches(options);
+    s.list = options.addValue<base::string>(
+        "--list", {},
+        "Print one line per camera or light (cameras, lights or cameras,lights): name, node path, "
+        "world position and view direction, lens or light values.");
     return s;
 }
 
@@ -253,8 +259,11 @@ int run(int argc, char** argv, HostLog& hostLog) {
     host::preview::PreviewRequest preview;
     if (!host::preview::readSwitches(switches.preview, model, preview, error))
         return usageError(error);
+    base::vector<host::ListKind> listed;
+    if (switches.list->isSet() && !host::parseListKinds(switches.list->value(), listed, error))
+        return usageError(error);
     const bool wantSummary =
-        switches.summary->isSet() ? switches.summary->value() : output == nullptr;
+        switches.summary->isSet() ? switches.summary->value() : !output && listed.empty();
 
     // Option values that do not fit their attribute are usage errors; find
     // them before the import rather than after it.
@@ -359,6 +368,10 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return failure(error);
     }
 
+    if (!listed.empty()) {
+        const base::string text = host::formatListing(*factory, listed);
+        std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
+    }
     if (wantSummary) {
         const base::string text = host::formatSummary(host::collectStats(*factory), seconds);
         std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);

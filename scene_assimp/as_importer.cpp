@@ -55,6 +55,24 @@ void logFatal(const base::string& path) noexcept {
     }
 }
 
+// Whether the text after the last '.' of the path's last component is
+// 'lowerCase' in any case.
+bool hasExtension(const base::string& path, std::string_view lowerCase) {
+    std::string_view file(path);
+    if (const auto slash = file.find_last_of("/\\"); slash != std::string_view::npos)
+        file.remove_prefix(slash + 1);
+    const auto dot = file.rfind('.');
+    if (dot == std::string_view::npos)
+        return false;
+    const std::string_view extension = file.substr(dot + 1);
+    if (extension.size() != lowerCase.size())
+        return false;
+    for (std::size_t i = 0; i < lowerCase.size(); ++i)
+        if (std::tolower(static_cast<unsigned char>(extension[i])) != lowerCase[i])
+            return false;
+    return true;
+}
+
 } // namespace
 
 bool ImportFlags::removesComponents() const noexcept {
@@ -116,20 +134,11 @@ const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& opti
 }
 
 std::uint8_t upAxisForPath(const base::string& path) {
-    std::string_view file(path);
-    if (const auto slash = file.find_last_of("/\\"); slash != std::string_view::npos)
-        file.remove_prefix(slash + 1);
-    const auto dot = file.rfind('.');
-    if (dot == std::string_view::npos)
-        return 1;
-    const std::string_view extension = file.substr(dot + 1);
-    constexpr std::string_view blend = "blend";
-    if (extension.size() != blend.size())
-        return 1;
-    for (std::size_t i = 0; i < blend.size(); ++i)
-        if (std::tolower(static_cast<unsigned char>(extension[i])) != blend[i])
-            return 1;
-    return 2;
+    return hasExtension(path, "blend") ? 2 : 1;
+}
+
+bool cameraPositionInNode(const base::string& path) {
+    return hasExtension(path, "gltf") || hasExtension(path, "glb");
 }
 
 base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginFactory& factory) {
@@ -228,6 +237,10 @@ void AssimpImporter::releaseImportState() noexcept {
     m_meshIndex.clear();
     m_meshSlots.clear();
     m_arrayPool.clear();
+    m_scene = nullptr;
+    m_sourceNodes.clear();
+    m_foldedFrames.clear();
+    m_givenNames.clear();
 }
 
 void AssimpImporter::beginImport(base::PluginFactory& factory, const aiScene* source) {
@@ -241,6 +254,10 @@ void AssimpImporter::beginImport(base::PluginFactory& factory, const aiScene* so
         m_meshIndex.emplace(source->mMeshes[i], i);
     m_arrayPool.clear();
     m_nodeMemo.clear();
+    m_scene = nullptr;
+    m_sourceNodes.clear();
+    m_foldedFrames.clear();
+    m_givenNames.clear();
 }
 
 void AssimpImporter::convert(const aiScene* source, const base::string& path) {
@@ -269,13 +286,14 @@ void AssimpImporter::convert(const aiScene* source, const base::string& path) {
         sceneObject->setAttribute(scene::scene_schema::upAxis(), upAxisForPath(path));
         sceneObject->setAttribute(scene::scene_schema::time(), base::TimeCode());
     }
+    m_scene = sceneObject.get();
 
     const NodeMap nodes = nodesByName(*m_factory);
     resolveJoints(source, nodes);
     // The animation conversion follows with the same map.
 
-    // The light conversion, then the camera conversion, come here, each in
-    // source order.
+    m_cameraPositionInNode = cameraPositionInNode(path);
+    importCamerasAndLights(source);
 }
 
 } // namespace as

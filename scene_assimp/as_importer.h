@@ -17,10 +17,14 @@
 #include "scene_interfaces.h"
 
 #include <cstdint>
+#include <string_view>
 
 struct aiScene;
 struct aiNode;
 struct aiMesh;
+struct aiCamera;
+struct aiLight;
+struct aiString;
 namespace Assimp {
 class Importer;
 }
@@ -53,6 +57,10 @@ base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginF
 // Blender files, 1 otherwise.
 std::uint8_t upAxisForPath(const base::string& path);
 
+// Whether assimp's reader for the model at 'path' also copies a camera node's
+// translation into the camera's own position (glTF and GLB files).
+bool cameraPositionInNode(const base::string& path);
+
 class AssimpImporter : public scene::SceneImportPlugin {
 public:
     AssimpImporter(base::IPluginDesc* descriptor, base::PluginFactory* factory, std::uint32_t id);
@@ -66,6 +74,7 @@ private:
     // The node conversion's tests; a second name so that each test file's
     // accessor stays the only definition of its struct.
     friend struct NodeTestAccess;
+    friend struct CameraLightTestAccess;
 
     using TextureList = base::vector<base::ref<scene::IBufferAdapter>>;
     using NodeMap = base::map<base::string, base::ref<scene::INode>>;
@@ -78,6 +87,24 @@ private:
                                            TextureList& embeddedTextures);
     // Binds the joints of every skin to the nodes of the scene (as_skin.cpp).
     void resolveJoints(const aiScene* scene, const NodeMap& nodesByName);
+
+    // Cameras and lights (as_camera_light.cpp): every light, then every
+    // camera, each below the node that carries its frame.
+    void importCamerasAndLights(const aiScene* scene);
+    base::ref<scene::ICamera> importCamera(const aiScene* scene, const aiCamera* camera);
+    base::ref<scene::ILight> importLight(const aiScene* scene, const aiLight* light);
+    // Folds the frame into the leaf node of the object's name, or makes a
+    // node for it; answers the node that carries the object.
+    base::ref<scene::INode> placeObject(const aiScene* scene, const aiString& name,
+                                        const base::vec3d& position, const base::vec3d& direction,
+                                        const base::vec3d& up);
+    void indexSourceNodes(const aiScene* scene);
+    // A unique name that is also none of the names given to converted nodes
+    // in this import: the factory's name service learns names only from
+    // objects registered after it last looked, not from renamed ones.
+    base::string freshName(const base::string& base);
+    // The first source node of the name, in conversion order; null if none.
+    const aiNode* sourceNode(const aiString& name) const;
 
     // Points the per-import state (factory, material list, mesh slots, pool,
     // node memo) at a new import of 'scene' into 'factory'.
@@ -98,6 +125,20 @@ private:
     // The node made for each source node during the running import; a node
     // reached twice yields the same object. Uncounted: the factory holds them.
     base::map<const aiNode*, scene::INode*> m_nodeMemo;
+    // The scene object of the running import (uncounted: the factory holds it).
+    base::IPlugin* m_scene = nullptr;
+    // Source nodes by name, first of each name; the names live in assimp's scene.
+    base::map<std::string_view, const aiNode*> m_sourceNodes;
+    // The camera or light frame folded into a leaf node, so that a second
+    // object of that node's name can be placed relative to the node as it was.
+    struct FoldedFrame {
+        base::vec3d position;
+        base::quatd rotation;
+    };
+    base::map<const scene::INode*, FoldedFrame> m_foldedFrames;
+    base::map<base::string, bool> m_givenNames;
+    // The reader stores a camera node's translation in the camera too (glTF).
+    bool m_cameraPositionInNode = false;
 };
 
 } // namespace as

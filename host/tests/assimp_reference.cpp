@@ -8,9 +8,18 @@
 // nodes must appear in it once each with assimp's vertex and face counts
 // (arrays the shared-array pool replaced by links are followed).
 //
-//   assimp-reference MODEL [DOCUMENT.json]
+// Given the host's listing of cameras and lights as well (scene-import --list
+// cameras,lights), it checks that each camera and light of assimp's scene is
+// listed, in order, at the world position and view direction assimp's scene
+// implies: the global transform of the node named like the object applied to
+// its local frame (the root's transform for an object without a node), to
+// 1e-4 relative. A glTF camera whose position repeats its node's translation
+// counts from the node's origin, as the importer takes it.
+//
+//   assimp-reference MODEL [DOCUMENT.json [LISTING]]
 //   exit 0 read (and the document matches), 1 assimp rejects MODEL,
-//        4 mesh counts differ, 5 the document does not parse, 2 usage
+//        4 mesh counts differ, 5 the document does not parse,
+//        6 a camera or light is missing or misplaced, 2 usage
 //
 // It links nothing of the project and is built without the sanitizers, so
 // it can run under an address-space cap.
@@ -21,6 +30,8 @@
 #include <rapidjson/error/en.h>
 
 #include <algorithm>
+#include <cctype>
+#include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <fstream>
@@ -215,11 +226,146 @@ int checkDocument(const char* path, const aiScene& scene) {
     return 4;
 }
 
+// ---- Cameras and lights ----
+
+struct Listed {
+    std::string kind, name, path;
+    double position[3] = {}, direction[3] = {};
+    bool placed = false;
+};
+
+std::vector<Listed> readListing(const char* path) {
+    std::vector<Listed> out;
+    std::ifstream in(path);
+    for (std::string line; std::getline(in, line);) {
+        std::vector<std::string> fields;
+        std::istringstream split(line);
+        for (std::string field; std::getline(split, field, '\t');)
+            fields.push_back(field);
+        if (fields.size() < 3)
+            continue;
+        Listed entry{fields[0], fields[1], fields[2]};
+        for (std::size_t i = 3; i < fields.size(); ++i) {
+            std::istringstream values(fields[i]);
+            std::string label;
+            values >> label;
+            double* target = label == "position"    ? entry.position
+                             : label == "direction" ? entry.direction
+                                                    : nullptr;
+            if (target && values >> target[0] >> target[1] >> target[2])
+                entry.placed = true;
+        }
+        out.push_back(entry);
+    }
+    return out;
+}
+
+aiMatrix4x4 globalTransform(const aiScene& scene, const aiString& name) {
+    const aiNode* node = name.length ? scene.mRootNode->FindNode(name) : nullptr;
+    if (!node)
+        return scene.mRootNode->mTransformation;
+    aiMatrix4x4 global;
+    for (int depth = 0; node && depth < 10000; node = node->mParent, ++depth)
+        global = node->mTransformation * global;
+    return global;
+}
+
+bool isGltf(std::string path) {
+    std::transform(path.begin(), path.end(), path.begin(),
+                   [](unsigned char c) { return char(std::tolower(c)); });
+    return path.ends_with(".gltf") || path.ends_with(".glb");
+}
+
+bool finite(const aiVector3D& v) {
+    return std::isfinite(v.x) && std::isfinite(v.y) && std::isfinite(v.z);
+}
+
+// Within 1e-4 of the expected vector's length (at least 1e-4 absolute).
+bool near(const double (&found)[3], const aiVector3D& expected) {
+    const double tolerance = 1e-4 * std::max(1.0, double(expected.Length()));
+    return std::fabs(found[0] - expected.x) <= tolerance &&
+           std::fabs(found[1] - expected.y) <= tolerance &&
+           std::fabs(found[2] - expected.z) <= tolerance;
+}
+
+// Compares one object; appends what differs to 'problems'.
+void checkFrame(const aiScene& scene, const Listed* listed, const char* kind, const aiString& name,
+                aiVector3D position, const aiVector3D& direction, std::string& problems) {
+    const std::string label = std::string(kind) + " '" + name.C_Str() + "'";
+    if (!listed || listed->kind != kind) {
+        problems += "; " + label + " not listed";
+        return;
+    }
+    if (!listed->placed) {
+        problems += "; " + label + " not in the scene";
+        return;
+    }
+    const aiMatrix4x4 global = globalTransform(scene, name);
+    char text[200];
+    if (finite(position)) {
+        const aiVector3D p = global * position;
+        if (!near(listed->position, p)) {
+            std::snprintf(text, sizeof text, "; %s at (%g, %g, %g), assimp (%g, %g, %g)",
+                          label.c_str(), listed->position[0], listed->position[1],
+                          listed->position[2], p.x, p.y, p.z);
+            problems += text;
+        }
+    }
+    aiVector3D d = aiMatrix3x3(global) * direction;
+    // A point light has no direction; a degenerate node none either.
+    if (finite(d) && d.Length() > 1e-12f) {
+        d.Normalize();
+        if (!near(listed->direction, d)) {
+            std::snprintf(text, sizeof text, "; %s looks (%g, %g, %g), assimp (%g, %g, %g)",
+                          label.c_str(), listed->direction[0], listed->direction[1],
+                          listed->direction[2], d.x, d.y, d.z);
+            problems += text;
+        }
+    }
+}
+
+int checkCamerasAndLights(const char* model, const char* listingPath, const aiScene& scene) {
+    // Each kind in its source order; the listing prints cameras first.
+    std::vector<Listed> listedCameras, listedLights;
+    for (Listed& entry : readListing(listingPath))
+        (entry.kind == "camera" ? listedCameras : listedLights).push_back(std::move(entry));
+    std::string problems;
+    std::size_t lights = 0, cameras = 0;
+    auto at = [](const std::vector<Listed>& list, std::size_t i) {
+        return i < list.size() ? &list[i] : nullptr;
+    };
+    for (unsigned i = 0; scene.mLights && i < scene.mNumLights; ++i)
+        if (const aiLight* light = scene.mLights[i]) {
+            checkFrame(scene, at(listedLights, lights++), "light", light->mName, light->mPosition,
+                       light->mDirection, problems);
+        }
+    const bool gltf = isGltf(model);
+    for (unsigned i = 0; scene.mCameras && i < scene.mNumCameras; ++i)
+        if (const aiCamera* camera = scene.mCameras[i]) {
+            aiVector3D position = camera->mPosition;
+            // The glTF reader repeats the node's translation in the camera.
+            const aiNode* node =
+                camera->mName.length ? scene.mRootNode->FindNode(camera->mName) : nullptr;
+            if (gltf && node &&
+                position == aiVector3D(node->mTransformation.a4, node->mTransformation.b4,
+                                       node->mTransformation.c4))
+                position = aiVector3D();
+            checkFrame(scene, at(listedCameras, cameras++), "camera", camera->mName, position,
+                       camera->mLookAt, problems);
+        }
+    if (listedCameras.size() + listedLights.size() != cameras + lights)
+        problems += "; " + std::to_string(listedCameras.size()) + " cameras and " +
+                    std::to_string(listedLights.size()) + " lights listed";
+    std::printf("frames: cameras %zu lights %zu%s\n", cameras, lights,
+                problems.empty() ? " match" : problems.c_str());
+    return problems.empty() ? 0 : 6;
+}
+
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc < 2 || argc > 3) {
-        std::fputs("usage: assimp-reference MODEL [DOCUMENT.json]\n", stderr);
+    if (argc < 2 || argc > 4) {
+        std::fputs("usage: assimp-reference MODEL [DOCUMENT.json [LISTING]]\n", stderr);
         return 2;
     }
     try {
@@ -227,7 +373,9 @@ int main(int argc, char** argv) {
         const aiScene* scene = importer.ReadFile(argv[1], defaultFlags);
         if (!scene || !scene->mRootNode)
             return 1;
-        return argc == 3 ? checkDocument(argv[2], *scene) : 0;
+        const int document = argc >= 3 ? checkDocument(argv[2], *scene) : 0;
+        const int frames = argc == 4 ? checkCamerasAndLights(argv[1], argv[3], *scene) : 0;
+        return document ? document : frames;
     } catch (const std::bad_alloc&) {
         // An allocation cap hit counts as a rejection, as assimp's own would.
         return 1;

@@ -4,7 +4,9 @@
 #   - the host never crashes, hangs or leaks (sanitizer reports fail it),
 #   - it exits 0 exactly when assimp itself reads the file with the same flags,
 #   - its JSON document parses and, once it holds meshes, the meshes that
-#     assimp's nodes reference appear with assimp's vertex and face counts.
+#     assimp's nodes reference appear with assimp's vertex and face counts,
+#   - its cameras and lights (scene-import --list) sit at the world positions
+#     and look along the directions that assimp's scene implies.
 #
 # usage: corpus_sweep.sh SCENE_IMPORT ASSIMP_REFERENCE CORPUS_DIR
 # Environment: SWEEP_JOBS (2), SWEEP_TIMEOUT seconds per file (300),
@@ -48,11 +50,12 @@ sweep_one() {
     out=$(mktemp -d "$work/f.XXXXXX")
     json=$out/scene.json
     err=$out/stderr
-    timeout -k 10 "$limit" "$host" -q "$file" -o "$json" >/dev/null 2>"$err"
+    timeout -k 10 "$limit" "$host" -q "$file" -o "$json" --list cameras,lights \
+        >"$out/listing" 2>"$err"
     local hc=$?
     local rc detail=""
     if [ $hc -eq 0 ]; then
-        detail=$(timeout -k 10 "$limit" "$reference" "$file" "$json" 2>&1)
+        detail=$(timeout -k 10 "$limit" "$reference" "$file" "$json" "$out/listing" 2>&1)
     else
         timeout -k 10 "$limit" "$reference" "$file" >/dev/null 2>&1
     fi
@@ -77,6 +80,8 @@ sweep_one() {
         verdict=mesh-unstable
     elif [ $hc -eq 0 ] && [ $rc -eq 4 ]; then
         verdict=mesh-mismatch
+    elif [ $hc -eq 0 ] && [ $rc -eq 6 ]; then
+        verdict=frame-mismatch
     elif [ $hc -eq 0 ]; then
         verdict=imported
     else
@@ -132,7 +137,8 @@ seconds=$(($(date +%s) - start))
 
 count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
-imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json)))
+imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json) +
+    $(count frame-mismatch)))
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
@@ -140,6 +146,10 @@ hangs=$(($(count hang) + $(count reference-hang)))
 badjson=$(count bad-json)
 meshdiff=$(count mesh-mismatch)
 checked=$(grep -c $'\tmeshes: [0-9]* match' "$work/results")
+framediff=$(count frame-mismatch)
+# "frames: cameras N lights M ..." of every imported file, summed.
+read -r cameras lights < <(grep -o 'frames: cameras [0-9]* lights [0-9]*' "$work/results" |
+    awk '{c += $3; l += $5} END {print c + 0, l + 0}')
 
 awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
     while IFS=$'\t' read -r verdict hc rc rel detail; do
@@ -147,6 +157,8 @@ awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
     done
 echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
-     "mesh counts checked $checked, mesh-count mismatches $meshdiff, seconds $seconds"
+     "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
+     "cameras $cameras, lights $lights, camera/light frame mismatches $framediff," \
+     "seconds $seconds"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff)) -eq 0 ]
+[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff)) -eq 0 ]

@@ -1,6 +1,8 @@
 // The host as its users see it: scene-import runs as a child process judged by
 // its exit code, standard streams and JSON; the --summary counts in-process.
+#include "listing.h"
 #include "scene_interfaces.h"
+#include "scene_schema.h"
 #include "scene_stats.h"
 
 #include <gtest/gtest.h>
@@ -9,6 +11,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -123,6 +126,7 @@ INSTANTIATE_TEST_SUITE_P(
         ExitCase{"BadBoolValue", {"-importCameras", "maybe", "{sample}"}, 2, "maybe"},
         ExitCase{"UpAxisOutOfRange", {"-upAxis", "300", "{sample}"}, 2, "--help"},
         ExitCase{"OutputWithoutFile", {"{sample}", "-o"}, 2, "--help"},
+        ExitCase{"BadListKind", {"--list", "planets", "{sample}"}, 2, "planets"},
         ExitCase{"ModuleMissing", {"--plugin", "{tmp}/none.so", "{sample}"}, 1, "none.so"},
         ExitCase{
             "UnwritableOutput", {"{sample}", "-o", "{tmp}/no/such/out.json"}, 1, "cannot write"}),
@@ -145,10 +149,9 @@ std::map<std::string, long long> summaryLines(const std::string& text) {
 // The summary of the sample goes to standard output unless a file is written
 // without --summary.
 TEST_F(HostTest, SummaryOfTheSampleUnlessWritingAFile) {
-    // Cameras and lights join the counts once they are converted.
-    const std::map<std::string, long long> expected{{"scene", 1}, {"node", 11},     {"mesh", 2},
-                                                    {"skin", 1},  {"vertices", 36}, {"faces", 32},
-                                                    {"joints", 2}};
+    const std::map<std::string, long long> expected{{"scene", 1},     {"node", 11},  {"mesh", 2},
+                                                    {"skin", 1},      {"camera", 1}, {"light", 1},
+                                                    {"vertices", 36}, {"faces", 32}, {"joints", 2}};
     using Args = std::vector<std::string>;
     for (const Args& args :
          {Args{"{sample}"}, Args{"{sample}", "-o", "{tmp}/out.json", "--summary"}}) {
@@ -252,6 +255,128 @@ TEST_F(HostTest, ValidateReportsTheMeshesOfTheSample) {
     const HostRun r = run({"--validate", "{sample}"});
     EXPECT_EQ(r.code, 0) << r.err;
     EXPECT_NE(r.out.find("validate:"), std::string::npos) << r.out;
+}
+
+// ---- Cameras and lights ----
+
+// The fields of a listing line, split at tabs.
+std::vector<std::string> fields(const std::string& line) {
+    std::vector<std::string> out;
+    std::istringstream split(line);
+    for (std::string field; std::getline(split, field, '\t');)
+        out.push_back(field);
+    return out;
+}
+
+std::vector<double> numbers(const std::string& field) {
+    std::istringstream in(field.substr(field.find(' ') + 1));
+    std::vector<double> out;
+    for (double v; in >> v;)
+        out.push_back(v);
+    return out;
+}
+
+void expectNumbers(const std::string& field, std::vector<double> expected) {
+    const std::vector<double> found = numbers(field);
+    ASSERT_EQ(found.size(), expected.size()) << field;
+    for (std::size_t i = 0; i < found.size(); ++i)
+        EXPECT_NEAR(found[i], expected[i], 1e-5) << field;
+}
+
+// The sample's camera sits on its node 0.5 above the root, tilted 10 degrees
+// down; the lamp sits on its own node.
+TEST_F(HostTest, ListsTheSampleRig) {
+    const HostRun r = run({"--list", "cameras,lights", "{sample}"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    std::istringstream lines(r.out);
+    std::string camera, light, extra;
+    ASSERT_TRUE(std::getline(lines, camera) && std::getline(lines, light)) << r.out;
+    EXPECT_FALSE(std::getline(lines, extra)) << "the summary is off while listing: " << r.out;
+
+    const auto c = fields(camera);
+    ASSERT_EQ(c.size(), 7u) << camera;
+    EXPECT_EQ(c[0], "camera");
+    EXPECT_TRUE(c[2].ends_with("/CameraNode")) << c[2];
+    expectNumbers(c[3], {0, 2.5, 8});
+    const double tilt = 10 * 3.14159265358979 / 180;
+    expectNumbers(c[4], {0, -std::sin(tilt), -std::cos(tilt)});
+    expectNumbers(c[6], {36, 24});
+
+    const auto l = fields(light);
+    ASSERT_EQ(l.size(), 7u) << light;
+    EXPECT_EQ(l[0], "light");
+    EXPECT_TRUE(l[2].ends_with("/LightNode")) << l[2];
+    expectNumbers(l[3], {3, 4.5, 2});
+    EXPECT_EQ(l[5], "type point");
+
+    const HostRun only = run({"--list", "lights", "{sample}"});
+    EXPECT_EQ(only.out, light + "\n");
+}
+
+TEST(Listing, WorldFramesThroughTheNodeTree) {
+    base::ref<base::PluginFactory> factory(new base::PluginFactory("listing"));
+    scene::register_scene_schema(*factory);
+    namespace n = scene::names;
+    auto make = [&](base::name_id type, const char* name) {
+        base::ref<base::IPlugin> object = factory->create(type, 3);
+        object->setAttribute(n::name, base::string(name));
+        return object;
+    };
+    auto adopt = [](base::IPlugin& parent, const base::ref<base::IPlugin>& child) {
+        parent.appendAttributeItem<base::ref<base::IPlugin>>(n::children, child);
+    };
+    // root: at (1, 0, 0), a half turn about Z; arm: 2 along its Y.
+    base::ref<base::IPlugin> root = make(n::node, "root"), arm = make(n::node, "arm");
+    root->setAttribute(n::translate, base::vec3d{1, 0, 0});
+    root->setAttribute(n::rotate, base::quatf{0, 0, 0, 1});
+    arm->setAttribute(n::translate, base::vec3d{0, 2, 0});
+    adopt(*root, arm);
+    adopt(*arm, arm); // a cycle is not followed
+    base::ref<base::IPlugin> sceneObject = make(n::scene, "scene");
+    sceneObject->setAttribute(n::root, root);
+
+    using L = scene::light_schema;
+    base::ref<base::IPlugin> spot = make(n::light, "spot"), panel = make(n::light, "panel"),
+                             ambient = make(n::light, "ambient"), loose = make(n::light, "loose");
+    spot->setAttribute(L::lightType(), std::uint8_t(2));
+    spot->setAttribute(L::spotConeAngle(), 30.0f);
+    panel->setAttribute(L::lightType(), std::uint8_t(3));
+    panel->setAttribute(L::size(), 2.0f);
+    panel->setAttribute(L::sizeRatio(), 0.5f);
+    adopt(*arm, spot);
+    adopt(*root, panel);
+    adopt(*arm, ambient);
+    adopt(*root, ambient); // listed at the first place met
+
+    const auto placed = host::placements(*factory, n::light);
+    ASSERT_EQ(placed.size(), 4u);
+    EXPECT_EQ(placed[0].path, "root/arm");
+    EXPECT_NEAR(placed[0].position.x, 1, 1e-6);
+    EXPECT_NEAR(placed[0].position.y, -2, 1e-6);
+    EXPECT_NEAR(placed[0].direction.z, -1, 1e-6);
+    EXPECT_EQ(placed[2].path, "root/arm");
+    EXPECT_EQ(placed[3].path, "");
+
+    const base::string text = host::formatListing(*factory, {host::ListKind::lights});
+    std::istringstream lines{std::string(text.data(), text.size())};
+    std::vector<std::string> all;
+    for (std::string line; std::getline(lines, line);)
+        all.push_back(line);
+    ASSERT_EQ(all.size(), 4u) << text;
+    EXPECT_EQ(all[0], "light\tspot\troot/arm\tposition 1 -2 0\tdirection 0 0 -1\ttype spot"
+                      "\tcolor 1 1 1\tcone 30 penumbra 5");
+    EXPECT_NE(all[1].find("\ttype area\tcolor 1 1 1\tsize 2 ratio 0.5"), std::string::npos)
+        << all[1];
+    EXPECT_NE(all[2].find("\ttype unset\tcolor 1 1 1"), std::string::npos) << all[2];
+    EXPECT_EQ(all[3], "light\tloose\t-\ttype unset\tcolor 1 1 1");
+    EXPECT_EQ(host::formatListing(*factory, {host::ListKind::cameras}), "");
+
+    base::vector<host::ListKind> kinds;
+    base::string error;
+    EXPECT_TRUE(host::parseListKinds("lights,cameras", kinds, error));
+    EXPECT_EQ(kinds.size(), 2u);
+    EXPECT_FALSE(host::parseListKinds("cameras,", kinds, error));
+    EXPECT_NE(error.find("''"), base::string::npos) << error;
 }
 
 // ---- Scene counts ----
