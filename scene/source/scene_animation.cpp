@@ -53,9 +53,14 @@ CurveEntries curveEntries(const ::base::AttribMap& curve) {
     if (curve.base()) {
         // Inherited entries: the map's own lookup knows the rules.
         auto find = [&](::base::name_id n) { return followed(curve.findInherited(n)); };
-        e = {find(names::times),    find(names::values),   find(names::interpolation),
-             find(names::preExtrapolation), find(names::postExtrapolation),
-             find(names::tangents), find(names::weights),  find(names::tension),
+        e = {find(names::times),
+             find(names::values),
+             find(names::interpolation),
+             find(names::preExtrapolation),
+             find(names::postExtrapolation),
+             find(names::tangents),
+             find(names::weights),
+             find(names::tension),
              find(names::tightness)};
         return e;
     }
@@ -130,11 +135,13 @@ struct IKeyframeChannel::Memo {
     std::atomic_flag busy = ATOMIC_FLAG_INIT;
 };
 
-IKeyframeChannel::IKeyframeChannel(::base::IPluginDesc* descriptor,
-                                   ::base::PluginFactory* factory, std::uint32_t id)
+IKeyframeChannel::IKeyframeChannel(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
+                                   std::uint32_t id)
     : ::base::IPlugin(descriptor, factory, id), m_memo(new Memo) {}
 
-IKeyframeChannel::~IKeyframeChannel() { delete m_memo; }
+IKeyframeChannel::~IKeyframeChannel() {
+    delete m_memo;
+}
 
 void IKeyframeChannel::attributeChanged(::base::name_id name, ::base::Attribute* attribute,
                                         std::uint32_t flags) {
@@ -229,8 +236,7 @@ T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const 
     }
     if (times->size() != values->size()) {
         channelLog(::base::logError,
-                   "keyframeChannel |{}| Different number of 'keys' and 'values' detected!",
-                   *this);
+                   "keyframeChannel |{}| Different number of 'keys' and 'values' detected!", *this);
         return T{};
     }
     c.times = times->data();
@@ -286,8 +292,8 @@ template <class T>
 bool IKeyframeChannel::setKey(std::uint32_t curveIndex, TimeCode time, const T& value) {
     const ::base::AttribArray* curves = findArray(names::curves);
     if (!curves || curves->size() == 0) {
-        channelLog(::base::logError,
-                   "keyframeChannel |{}| Trying to set a key without any curves!", *this);
+        channelLog(::base::logError, "keyframeChannel |{}| Trying to set a key without any curves!",
+                   *this);
         return false;
     }
     ::base::AttribMap* curve =
@@ -341,7 +347,6 @@ bool IKeyframeChannel::setKey(std::uint32_t curveIndex, TimeCode time, const T& 
     template bool IKeyframeChannel::setKey<T>(std::uint32_t, TimeCode, const T&);
 SCENE_CHANNEL_TYPES(SCENE_CHANNEL_TYPE)
 #undef SCENE_CHANNEL_TYPE
-
 
 // ---- Layer playback ----
 
@@ -413,7 +418,9 @@ IAnimLayer::IAnimLayer(::base::IPluginDesc* descriptor, ::base::PluginFactory* f
                        std::uint32_t id)
     : ::base::IPlugin(descriptor, factory, id), m_playback(new Playback) {}
 
-IAnimLayer::~IAnimLayer() { delete m_playback; }
+IAnimLayer::~IAnimLayer() {
+    delete m_playback;
+}
 
 void IAnimLayer::pluginChanged(::base::IPlugin&, ::base::name_id, std::uint32_t, std::uint64_t) {
     m_playback->dirty = true;
@@ -474,9 +481,8 @@ void IAnimLayer::evaluate() {
                                          "animLayer |{}| Negative animation clip duration!",
                                          layerName);
                 clip->addListener(*this);
-                if (const auto* list =
-                        clip->findVecAttribute<::base::ref<::base::IPlugin>>(
-                            names::keyframeChannels)) {
+                if (const auto* list = clip->findVecAttribute<::base::ref<::base::IPlugin>>(
+                        names::keyframeChannels)) {
                     record.channels.reserve(list->size());
                     for (const auto& ref : *list) {
                         auto* channel = dynamic_cast<IKeyframeChannel*>(ref.get());

@@ -6,6 +6,7 @@
 #include "b_math.h"
 #include "b_timecode.h"
 
+#include <algorithm>
 #include <array>
 #include <cmath>
 #include <cstdint>
@@ -13,7 +14,6 @@
 #include <limits>
 #include <type_traits>
 #include <utility>
-#include <algorithm>
 
 // The value types a channel evaluates: X(T).
 #define SCENE_CHANNEL_TYPES(X)                                                                     \
@@ -47,7 +47,7 @@ struct Traits {
     static constexpr bool quat = std::is_same_v<T, ::base::base_quat<C>>;
 };
 template <class T>
-    requires std::is_arithmetic_v<T>
+requires std::is_arithmetic_v<T>
 struct Traits<T> {
     using C = T;
     using S = std::conditional_t<std::is_same_v<T, double>, double, float>;
@@ -77,7 +77,7 @@ inline T store(const Comps<T>& c) {
             // Truncation toward zero; out-of-range and NaN saturate rather
             // than being undefined.
             const auto x = c[i];
-            raw[i] = x != x                           ? C(0)
+            raw[i] = x != x                                      ? C(0)
                      : x >= float(std::numeric_limits<C>::max()) ? std::numeric_limits<C>::max()
                      : x <= float(std::numeric_limits<C>::min()) ? std::numeric_limits<C>::min()
                                                                  : C(x);
@@ -160,7 +160,9 @@ struct Curve {
     }
 };
 
-inline double seconds(double ticks) { return ticks * (1.0 / double(TimeCode::ticksPerSecond)); }
+inline double seconds(double ticks) {
+    return ticks * (1.0 / double(TimeCode::ticksPerSecond));
+}
 
 // The first index whose time is greater than t, within [lo, hi): halving while
 // the range holds more than 3 keys, then a forward scan.

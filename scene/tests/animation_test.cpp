@@ -23,7 +23,9 @@ using quatf = base::base_quat<float>;
 using quatd = base::base_quat<double>;
 
 constexpr std::int64_t second = TimeCode::ticksPerSecond;
-TimeCode secs(double s) { return TimeCode::fromSeconds(s); }
+TimeCode secs(double s) {
+    return TimeCode::fromSeconds(s);
+}
 
 template <class T>
 ref<T> make(PluginFactory& factory, const char* type) {
@@ -99,7 +101,9 @@ struct Channel : ::testing::Test {
     T at(double s) {
         return channel->computeValue<T>(0, secs(s));
     }
-    std::size_t logged(const std::string& text) { return log.count("keyframeChannel |ch| " + text); }
+    std::size_t logged(const std::string& text) {
+        return log.count("keyframeChannel |ch| " + text);
+    }
 };
 
 // The shared behaviour of the non-rotation types, with keys 0 → 10 over one
@@ -119,8 +123,8 @@ void linearCases(Channel& t) {
         double time, expected;
     };
     const Row rows[] = {
-        {0, 1, 2.0, 20},   {0, 2, 1.5, 5},    {0, 3, 1.5, 15},  {0, 3, 3.25, 32.5},
-        {0, 4, 1.25, 7.5}, {0, 4, 2.25, 2.5}, {1, 0, -1.0, -10}, {2, 0, -0.25, 7.5},
+        {0, 1, 2.0, 20},     {0, 2, 1.5, 5},     {0, 3, 1.5, 15},    {0, 3, 3.25, 32.5},
+        {0, 4, 1.25, 7.5},   {0, 4, 2.25, 2.5},  {1, 0, -1.0, -10},  {2, 0, -0.25, 7.5},
         {3, 0, -0.75, -7.5}, {4, 0, -0.25, 2.5}, {4, 0, -1.25, 7.5},
     };
     for (const Row& r : rows) {
@@ -134,8 +138,8 @@ void linearCases(Channel& t) {
     t.keys<T>({0.5}, {splat<T>(7)});
     EXPECT_TRUE(allEqual(t.at<T>(-100), 7));
     EXPECT_TRUE(allEqual(t.at<T>(100), 7));
-    t.keys<T>({0, 1}, {splat<T>(0), splat<T>(10)}).setAttribute(names::interpolation,
-                                                                std::uint8_t(0));
+    t.keys<T>({0, 1}, {splat<T>(0), splat<T>(10)})
+        .setAttribute(names::interpolation, std::uint8_t(0));
     EXPECT_TRUE(allEqual(t.at<T>(0.99), 0));
 }
 
@@ -285,9 +289,8 @@ TEST_F(Channel, ModesOutsideTheEnumerationThrow) {
     base::AttribMap& c = keys<float>({0, 1}, {0.0f, 10.0f});
     c.setAttribute(names::interpolation, std::uint8_t(4));
     EXPECT_THROW(at<float>(0.5), base::switch_exception);
-    keys<float>({0, 1}, {0.0f, 10.0f})
-        .vecAttribute<std::uint8_t>(names::interpolation)
-        ->items() = {1, 9};
+    keys<float>({0, 1}, {0.0f, 10.0f}).vecAttribute<std::uint8_t>(names::interpolation)->items() = {
+        1, 9};
     try {
         at<float>(0.5);
         ADD_FAILURE();
@@ -451,8 +454,9 @@ TEST_F(Layer, BrokenClipsAreSkippedWithTheirLines) {
     noValues->arrayAttribute(names::curves)->appendMap();
     auto odd = make<IKeyframeChannel>(*factory, "keyframeChannel");
     odd->setAttribute(names::name, base::string("odd"));
-    odd->arrayAttribute(names::curves)->appendMap()->appendAttributeItem(names::values,
-                                                                          std::uint8_t(1));
+    odd->arrayAttribute(names::curves)
+        ->appendMap()
+        ->appendAttributeItem(names::values, std::uint8_t(1));
     auto& list = clip->vecAttribute<ref<IPlugin>>(names::keyframeChannels)->items();
     list.push_back(ref<IPlugin>());
     list.push_back(empty);
