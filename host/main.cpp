@@ -4,11 +4,13 @@
 //
 // Exit codes: 0 imported, 1 the model (or the module, or the output) failed,
 // 2 usage error, 3 a mesh failed validation.
+#include "animation_view.h"
 #include "b_cmdline.h"
 #include "b_exception.h"
 #include "b_format.h"
 #include "b_json.h"
 #include "b_log.h"
+#include "listing.h"
 #include "module_loader.h"
 #include "scene_cmdline.h"
 #include "scene_importer.h"
@@ -218,6 +220,8 @@ ValidationResult validateMeshes(const base::PluginFactory& factory) {
 int run(int argc, char** argv, HostLog& hostLog) {
     base::CmdLineOptions options;
     const HostSwitches switches = registerSwitches(options);
+    const host::AnimationSwitches animation = host::registerAnimationSwitches(options);
+    base::CmdLineValue<base::string>* listing = host::registerListing(options);
     base::string error;
     base::vector<base::string> positional;
     if (!options.parse(argc, argv, error, &positional))
@@ -309,6 +313,9 @@ int run(int argc, char** argv, HostLog& hostLog) {
         if (!scene::apply_command_line(options, *sceneObject, scene::scene_schema::type(), error))
             return usageError(error);
 
+    if (animation.time->isSet())
+        host::playAt(*factory, animation.time->value());
+
     int code = exitImported;
     if (switches.validate->isSet() && switches.validate->value()) {
         // Findings are warnings and errors; show them even under -q.
@@ -344,9 +351,16 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return failure(base::format("writing '{}' failed", toStdout ? "<stdout>" : *output));
     }
 
+    // --list and --frames print on standard output (after the scene is written).
+    base::string report;
+    if (!host::animationReport(*factory, animation, listing, report, error))
+        return usageError(error);
+    std::fwrite(report.data(), 1, report.size(), stdout);
+
     if (wantSummary) {
-        const base::string text = host::formatSummary(host::collectStats(*factory), seconds);
-        std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
+        const base::string text = host::formatSummary(host::collectStats(*factory), seconds) +
+                                  host::animationSummary(*factory);
+        std::fwrite(text.data(), 1, text.size(), toStdout || !report.empty() ? stderr : stdout);
     }
     return code;
 }
