@@ -317,5 +317,53 @@ TEST_F(Animations, GltfPlaysAndASecondImportKeepsTheFirstScene) {
     fsys::remove(path, ignored);
 }
 
+// A Collada node animated through its matrix: assimp splits it into
+// translation, rotation and scale keys in seconds.
+TEST_F(Animations, ColladaMatrixAnimationPlays) {
+    namespace fsys = std::filesystem;
+    const fsys::path path =
+        fsys::path(testing::TempDir()) / ("as_anim_" + std::to_string(::getpid()) + ".dae");
+    std::ofstream(path) << R"(<?xml version="1.0" encoding="utf-8"?>
+<COLLADA xmlns="http://www.collada.org/2005/11/COLLADASchema" version="1.4.1">
+  <asset><unit name="meter" meter="1"/><up_axis>Y_UP</up_axis></asset>
+  <library_animations>
+    <animation id="move">
+      <source id="move-in"><float_array id="move-in-array" count="2">0 2</float_array>
+        <technique_common><accessor source="#move-in-array" count="2" stride="1"><param name="TIME" type="float"/></accessor></technique_common></source>
+      <source id="move-out"><float_array id="move-out-array" count="32">1 0 0 0 0 1 0 0 0 0 1 0 0 0 0 1 1 0 0 4 0 1 0 0 0 0 1 0 0 0 0 1</float_array>
+        <technique_common><accessor source="#move-out-array" count="2" stride="16"><param name="TRANSFORM" type="float4x4"/></accessor></technique_common></source>
+      <source id="move-interp"><Name_array id="move-interp-array" count="2">LINEAR LINEAR</Name_array>
+        <technique_common><accessor source="#move-interp-array" count="2" stride="1"><param name="INTERPOLATION" type="name"/></accessor></technique_common></source>
+      <sampler id="move-sampler"><input semantic="INPUT" source="#move-in"/><input semantic="OUTPUT" source="#move-out"/><input semantic="INTERPOLATION" source="#move-interp"/></sampler>
+      <channel source="#move-sampler" target="Box/transform"/>
+    </animation>
+  </library_animations>
+  <library_visual_scenes>
+    <visual_scene id="Scene" name="Scene">
+      <node id="Box" name="Box" type="NODE"><matrix sid="transform">1 0 0 0 0 1 0 0 0 0 1 0 0 0 0 1</matrix></node>
+      <node id="Still" name="Still" type="NODE"><matrix sid="transform">1 0 0 5 0 1 0 0 0 0 1 0 0 0 0 1</matrix></node>
+    </visual_scene>
+  </library_visual_scenes>
+  <scene><instance_visual_scene url="#Scene"/></scene>
+</COLLADA>
+)";
+    ASSERT_TRUE(scene::query<scene::ISceneImporter>(*importerObject)
+                    ->import(*factory, base::string(path.string().c_str())));
+    EXPECT_EQ(times("Box_Translate"), (std::vector<std::int64_t>{0, 2 * second}));
+    // The rotation never changes: one value, no times.
+    ASSERT_TRUE(curve("Box_Rotate"));
+    EXPECT_FALSE(curve("Box_Rotate")->findEntry(names::times));
+    ref<scene::INode> box = node("Box"), still = node("Still");
+    EXPECT_FALSE(still->findEntry(names::translate)->asLink());
+    setSceneTime(1);
+    EXPECT_NEAR(scene::get(*box, names::translate, base::vec3d{}).x, 2, 1e-6);
+    setSceneTime(5);
+    EXPECT_NEAR(scene::get(*box, names::translate, base::vec3d{}).x, 4, 1e-6);
+    EXPECT_EQ(scene::get(*objectsOf(*factory, names::scene)[0], names::endTime, TimeCode()).ticks(),
+              2 * second);
+    std::error_code ignored;
+    fsys::remove(path, ignored);
+}
+
 } // namespace animtest
 } // namespace as
