@@ -139,19 +139,26 @@ base::string line(const Placement& placement) {
 
 } // namespace
 
+constexpr std::pair<std::string_view, ListKind> kindNames[] = {{"cameras", ListKind::cameras},
+                                                               {"lights", ListKind::lights},
+                                                               {"nodes", ListKind::nodes},
+                                                               {"poses", ListKind::poses}};
+
 bool parseListKinds(std::string_view text, base::vector<ListKind>& kinds, base::string& error) {
     kinds.clear();
     while (true) {
         const auto comma = text.find(',');
         const std::string_view word = text.substr(0, comma);
-        if (word == "cameras") {
-            kinds.push_back(ListKind::cameras);
-        } else if (word == "lights") {
-            kinds.push_back(ListKind::lights);
-        } else {
-            error = base::format("--list takes cameras, lights or cameras,lights, not '{}'", word);
+        const auto* known = std::find_if(std::begin(kindNames), std::end(kindNames),
+                                         [&](const auto& entry) { return entry.first == word; });
+        if (known == std::end(kindNames)) {
+            error = base::format(
+                "--list takes cameras, lights, nodes or poses (several separated by commas), "
+                "not '{}'",
+                word);
             return false;
         }
+        kinds.push_back(known->second);
         if (comma == std::string_view::npos)
             return true;
         text.remove_prefix(comma + 1);
@@ -186,17 +193,76 @@ base::vector<Placement> placements(const base::PluginFactory& factory, base::nam
     return out;
 }
 
+base::vector<NodeWorld> nodeWorlds(const base::PluginFactory& factory) {
+    base::vector<NodeWorld> out;
+    // A node listed under its own subtree is walked once.
+    base::map<const base::IPlugin*, bool> seen;
+    struct Pending {
+        const base::IPlugin* node;
+        base::mat43 parent;
+    };
+    base::vector<Pending> pending;
+    for (std::uint32_t id = 0; id < factory.pluginCount(); ++id) {
+        base::ref<base::IPlugin> object = factory.plugin(id);
+        if (!object || object->className() != scene::names::scene)
+            continue;
+        const auto* root = object->findAttribute<base::ref<base::IPlugin>>(scene::names::root);
+        if (!root || !*root)
+            continue;
+        pending.push_back({root->get(), base::mat43::identity()});
+        while (!pending.empty()) {
+            const Pending next = pending.back();
+            pending.pop_back();
+            if (!seen.emplace(next.node, true).second)
+                continue;
+            const auto* hierarchical = scene::query<scene::IHierarchical>(*next.node);
+            const base::mat43 world =
+                hierarchical ? next.parent * hierarchical->localTransformation() : next.parent;
+            out.push_back({next.node, world});
+            if (const Children* children = childrenOf(*next.node))
+                for (std::size_t c = children->size(); c-- > 0;)
+                    if ((*children)[c] && (*children)[c]->className() == scene::names::node)
+                        pending.push_back({(*children)[c].get(), world});
+        }
+    }
+    return out;
+}
+
 base::string formatListing(const base::PluginFactory& factory,
                            const base::vector<ListKind>& kinds) {
     base::string out;
+    const auto asked = [&](ListKind kind) {
+        return std::find(kinds.begin(), kinds.end(), kind) != kinds.end();
+    };
     for (const ListKind kind : {ListKind::cameras, ListKind::lights}) {
-        if (std::find(kinds.begin(), kinds.end(), kind) == kinds.end())
+        if (!asked(kind))
             continue;
         const base::name_id type =
             kind == ListKind::cameras ? scene::names::camera : scene::names::light;
         for (const Placement& placement : placements(factory, type))
             out += line(placement);
     }
+    if (!asked(ListKind::nodes) && !asked(ListKind::poses))
+        return out;
+    const base::vector<NodeWorld> worlds = nodeWorlds(factory);
+    if (asked(ListKind::nodes))
+        for (const NodeWorld& n : worlds) {
+            out += n.node->name(true);
+            appendNumbers(out, "", {n.world.t.x, n.world.t.y, n.world.t.z}, 9);
+            out += '\n';
+        }
+    if (asked(ListKind::poses))
+        for (const NodeWorld& n : worlds) {
+            const auto t = scene::get(*n.node, scene::names::translate, base::vec3d{});
+            const auto r = scene::get(*n.node, scene::names::rotate, base::quatf::identity());
+            const auto s = scene::get(*n.node, scene::names::scale, base::vec3f{1, 1, 1});
+            out += n.node->name(true);
+            appendNumbers(out, "",
+                          {t.x, t.y, t.z, double(r.w), double(r.x), double(r.y), double(r.z),
+                           double(s.x), double(s.y), double(s.z)},
+                          9);
+            out += '\n';
+        }
     return out;
 }
 

@@ -4,6 +4,7 @@
 //
 // Exit codes: 0 imported, 1 the model (or the module, or the output) failed,
 // 2 usage error, 3 a mesh failed validation.
+#include "animation_view.h"
 #include "b_cmdline.h"
 #include "b_exception.h"
 #include "b_format.h"
@@ -84,8 +85,9 @@ HostSwitches registerSwitches(base::CmdLineOptions& options) {
     s.preview = host::preview::registerSwitches(options);
     s.list = options.addValue<base::string>(
         "--list", {},
-        "Print one line per camera or light (cameras, lights or cameras,lights): name, node path, "
-        "world position and view direction, lens or light values.");
+        "Print one line per object of the kinds given, separated by commas: cameras and lights "
+        "(name, node path, world position and view direction, lens or light values), nodes "
+        "(world position of every node), poses (local translate, rotate and scale).");
     return s;
 }
 
@@ -227,6 +229,7 @@ ValidationResult validateMeshes(const base::PluginFactory& factory) {
 int run(int argc, char** argv, HostLog& hostLog) {
     base::CmdLineOptions options;
     const HostSwitches switches = registerSwitches(options);
+    const host::AnimationSwitches animation = host::registerAnimationSwitches(options);
     base::string error;
     base::vector<base::string> positional;
     if (!options.parse(argc, argv, error, &positional))
@@ -324,6 +327,9 @@ int run(int argc, char** argv, HostLog& hostLog) {
         if (!scene::apply_command_line(options, *sceneObject, scene::scene_schema::type(), error))
             return usageError(error);
 
+    if (animation.time->isSet())
+        host::playAt(*factory, animation.time->value());
+
     int code = exitImported;
     if (switches.validate->isSet() && switches.validate->value()) {
         // Findings are warnings and errors; show them even under -q.
@@ -368,13 +374,15 @@ int run(int argc, char** argv, HostLog& hostLog) {
             return failure(error);
     }
 
-    if (!listed.empty()) {
-        const base::string text = host::formatListing(*factory, listed);
-        std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
-    }
+    // --list and --frames print on standard output after the scene is written
+    // (on standard error when the scene itself goes to standard output).
+    const base::string report = host::animationReport(*factory, animation, listed);
+    std::fwrite(report.data(), 1, report.size(), toStdout ? stderr : stdout);
+
     if (wantSummary) {
-        const base::string text = host::formatSummary(host::collectStats(*factory), seconds);
-        std::fwrite(text.data(), 1, text.size(), toStdout ? stderr : stdout);
+        const base::string text = host::formatSummary(host::collectStats(*factory), seconds) +
+                                  host::animationSummary(*factory);
+        std::fwrite(text.data(), 1, text.size(), toStdout || !report.empty() ? stderr : stdout);
     }
     return code;
 }

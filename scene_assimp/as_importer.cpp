@@ -163,6 +163,27 @@ base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginF
 
 // ---- AssimpImporter ---------------------------------------------------------------
 
+void AssimpImporter::addSourceNames(const aiNode* root, NodeMap& nodes) const {
+    // In conversion order (depth first, parents before children), so the
+    // first node of a name is the one a unique name would have kept.
+    // A node listing one of its ancestors is walked once.
+    base::vector<const aiNode*> pending{root};
+    base::map<const aiNode*, bool> seen;
+    while (!pending.empty()) {
+        const aiNode* node = pending.back();
+        pending.pop_back();
+        if (!node || !seen.emplace(node, true).second)
+            continue;
+        if (auto found = m_nodeMemo.find(node); found != m_nodeMemo.end()) {
+            base::string source(node->mName.C_Str(), node->mName.length);
+            if (found->second->name() != source)
+                nodes.emplace(std::move(source), base::ref<scene::INode>(found->second));
+        }
+        for (unsigned i = node->mChildren ? node->mNumChildren : 0; i-- > 0;)
+            pending.push_back(node->mChildren[i]);
+    }
+}
+
 AssimpImporter::AssimpImporter(base::IPluginDesc* descriptor, base::PluginFactory* factory,
                                std::uint32_t id)
     : scene::SceneImportPlugin(descriptor, factory, id) {}
@@ -288,9 +309,10 @@ void AssimpImporter::convert(const aiScene* source, const base::string& path) {
     }
     m_scene = sceneObject.get();
 
-    const NodeMap nodes = nodesByName(*m_factory);
+    NodeMap nodes = nodesByName(*m_factory);
+    addSourceNames(source->mRootNode, nodes);
     resolveJoints(source, nodes);
-    // The animation conversion follows with the same map.
+    importAnimations(source, nodes, sceneObject.get());
 
     m_cameraPositionInNode = cameraPositionInNode(path);
     importCamerasAndLights(source);

@@ -75,6 +75,7 @@ private:
     // accessor stays the only definition of its struct.
     friend struct NodeTestAccess;
     friend struct CameraLightTestAccess;
+    friend struct AnimationTestAccess;
 
     using TextureList = base::vector<base::ref<scene::IBufferAdapter>>;
     using NodeMap = base::map<base::string, base::ref<scene::INode>>;
@@ -87,6 +88,15 @@ private:
                                            TextureList& embeddedTextures);
     // Binds the joints of every skin to the nodes of the scene (as_skin.cpp).
     void resolveJoints(const aiScene* scene, const NodeMap& nodesByName);
+    // Also keys each node converted by this import under its source name,
+    // where that differs from its unique name (first node wins), so joints
+    // and animation channels find nodes as assimp does.
+    void addSourceNames(const aiNode* root, NodeMap& nodesByName) const;
+    // Clips, layers and channels for the source animations, driving the
+    // nodes of 'nodesByName'; the scene-wide range and layer list go to
+    // 'sceneObject', this import's scene (as_animation.cpp).
+    void importAnimations(const aiScene* scene, const NodeMap& nodesByName,
+                          base::IPlugin* sceneObject);
 
     // Cameras and lights (as_camera_light.cpp): every light, then every
     // camera, each below the node that carries its frame.

@@ -16,10 +16,19 @@
 // 1e-4 relative. A glTF camera whose position repeats its node's translation
 // counts from the node's origin, as the importer takes it.
 //
+// With a document it also prints "playback-times: T..." when the scene has
+// node animations: five times spread over each animation, ends included.
+// Given the host's "--time T... --list poses" output for those times, it
+// checks that every animated node (with a name that is unique in the tree)
+// has the translation, rotation and scale that linear interpolation and
+// slerp of assimp's keys give, to 1e-4.
+//
 //   assimp-reference MODEL [DOCUMENT.json [LISTING]]
+//   assimp-reference --poses MODEL POSES.txt
 //   exit 0 read (and the document matches), 1 assimp rejects MODEL,
-//        4 mesh counts differ, 5 the document does not parse,
-//        6 a camera or light is missing or misplaced, 2 usage
+//        4 mesh counts differ, 5 the document does not parse, 2 usage,
+//        6 a camera or light is missing or misplaced (or, with --poses,
+//        a played pose differs)
 //
 // It links nothing of the project and is built without the sanitizers, so
 // it can run under an address-space cap.
@@ -30,16 +39,19 @@
 #include <rapidjson/error/en.h>
 
 #include <algorithm>
+#include <array>
 #include <cctype>
 #include <cmath>
 #include <cstdint>
 #include <cstdio>
 #include <fstream>
 #include <iterator>
+#include <map>
 #include <set>
 #include <sstream>
 #include <string>
 #include <string_view>
+#include <type_traits>
 #include <utility>
 #include <vector>
 
@@ -361,20 +373,250 @@ int checkCamerasAndLights(const char* model, const char* listingPath, const aiSc
     return problems.empty() ? 0 : 6;
 }
 
+// ---- Playback ----
+
+constexpr double ticksPerSecond = 46186158000.0;
+
+double rateOf(const aiAnimation& a) {
+    return a.mTicksPerSecond > 0 && std::isfinite(a.mTicksPerSecond) ? a.mTicksPerSecond : 25.0;
+}
+
+std::int64_t sceneTicks(double ticks, double rate) {
+    const double t = ticks / rate * ticksPerSecond;
+    if (t >= 9223372036854775807.0)
+        return INT64_MAX;
+    if (!(t > -9223372036854775807.0))
+        return INT64_MIN;
+    return std::int64_t(t);
+}
+
+// One animated attribute: key times in scene ticks and values (x, y, z or
+// w, x, y, z), sorted by time, keys at non-finite times left out.
+struct Track {
+    std::vector<std::int64_t> times;
+    std::vector<std::array<double, 4>> values;
+    bool rotation = false;
+};
+
+template <class Key>
+Track trackOf(const Key* keys, unsigned count, double rate, bool rotation) {
+    std::vector<const Key*> sorted;
+    for (unsigned k = 0; keys && k < count; ++k)
+        if (std::isfinite(keys[k].mTime))
+            sorted.push_back(&keys[k]);
+    std::stable_sort(sorted.begin(), sorted.end(),
+                     [](const Key* a, const Key* b) { return a->mTime < b->mTime; });
+    Track track;
+    track.rotation = rotation;
+    for (const Key* k : sorted) {
+        track.times.push_back(sceneTicks(k->mTime, rate));
+        if constexpr (std::is_same_v<Key, aiQuatKey>)
+            track.values.push_back({k->mValue.w, k->mValue.x, k->mValue.y, k->mValue.z});
+        else
+            track.values.push_back({k->mValue.x, k->mValue.y, k->mValue.z, 0});
+    }
+    return track;
+}
+
+// The last animation's track wins for each (node, attribute 0/1/2).
+std::map<std::pair<std::string, int>, Track> animatedTracks(const aiScene& scene) {
+    std::map<std::pair<std::string, int>, Track> tracks;
+    for (unsigned a = 0; scene.mAnimations && a < scene.mNumAnimations; ++a) {
+        const aiAnimation* anim = scene.mAnimations[a];
+        for (unsigned c = 0; anim && anim->mChannels && c < anim->mNumChannels; ++c) {
+            const aiNodeAnim* ch = anim->mChannels[c];
+            if (!ch || !scene.mRootNode->FindNode(ch->mNodeName))
+                continue;
+            const std::string name(ch->mNodeName.C_Str());
+            const double rate = rateOf(*anim);
+            Track lists[3] = {trackOf(ch->mPositionKeys, ch->mNumPositionKeys, rate, false),
+                              trackOf(ch->mRotationKeys, ch->mNumRotationKeys, rate, true),
+                              trackOf(ch->mScalingKeys, ch->mNumScalingKeys, rate, false)};
+            for (int i = 0; i < 3; ++i)
+                if (!lists[i].times.empty())
+                    tracks[{name, i}] = std::move(lists[i]);
+        }
+    }
+    return tracks;
+}
+
+std::vector<double> playbackTimes(const aiScene& scene) {
+    std::set<double> times;
+    for (unsigned a = 0; scene.mAnimations && a < scene.mNumAnimations; ++a) {
+        const aiAnimation* anim = scene.mAnimations[a];
+        double lo = INFINITY, hi = -INFINITY;
+        for (unsigned c = 0; anim && anim->mChannels && c < anim->mNumChannels; ++c) {
+            const aiNodeAnim* ch = anim->mChannels[c];
+            if (!ch || !scene.mRootNode->FindNode(ch->mNodeName))
+                continue;
+            auto widen = [&](const auto* keys, unsigned n) {
+                for (unsigned k = 0; keys && k < n; ++k)
+                    if (std::isfinite(keys[k].mTime)) {
+                        lo = std::min(lo, keys[k].mTime);
+                        hi = std::max(hi, keys[k].mTime);
+                    }
+            };
+            widen(ch->mPositionKeys, ch->mNumPositionKeys);
+            widen(ch->mRotationKeys, ch->mNumRotationKeys);
+            widen(ch->mScalingKeys, ch->mNumScalingKeys);
+        }
+        if (lo > hi)
+            continue;
+        // The host's switch parser would read a negative time as a switch.
+        for (int i = 0; i < 5; ++i)
+            if (const double t = (lo + (hi - lo) * i / 4) / rateOf(*anim); t >= 0)
+                times.insert(t);
+    }
+    // Enough to cover many animations without one file dominating the sweep.
+    std::vector<double> all(times.begin(), times.end());
+    if (all.size() > 40) {
+        std::vector<double> picked;
+        for (std::size_t i = 0; i < 40; ++i)
+            picked.push_back(all[i * (all.size() - 1) / 39]);
+        all = picked;
+    }
+    return all;
+}
+
+// The value a track plays at 'ticks': constant before and after its keys,
+// a key's own value within a microsecond after it, otherwise linear (slerp
+// along the shorter arc for rotations) between the keys around the time.
+std::array<double, 4> play(const Track& track, std::int64_t ticks) {
+    const auto& t = track.times;
+    const std::size_t k = std::size_t(std::upper_bound(t.begin(), t.end(), ticks) - t.begin());
+    if (k == 0)
+        return track.values.front();
+    const std::size_t s = k - 1;
+    if (k == t.size() || double(ticks) - double(t[s]) <= 46186)
+        return track.values[s];
+    const double u = (double(ticks) - double(t[s])) / (double(t[k]) - double(t[s]));
+    std::array<double, 4> a = track.values[s], b = track.values[k], out{};
+    double ka = 1 - u, kb = u;
+    if (track.rotation) {
+        double dot = a[0] * b[0] + a[1] * b[1] + a[2] * b[2] + a[3] * b[3];
+        if (dot < 0) {
+            dot = -dot;
+            for (double& x : b)
+                x = -x;
+        }
+        if (dot < 1) {
+            const double angle = std::acos(dot), sine = std::sin(angle);
+            if (sine > 1e-6) {
+                ka = std::sin((1 - u) * angle) / sine;
+                kb = std::sin(u * angle) / sine;
+            }
+        }
+    }
+    for (int i = 0; i < 4; ++i)
+        out[i] = a[i] * ka + b[i] * kb;
+    return out;
+}
+
+bool close(const std::array<double, 4>& expected, const double* found, int n, bool rotation) {
+    std::array<double, 4> e = expected, f{};
+    std::copy(found, found + n, f.begin());
+    if (rotation) {
+        double le = 0, lf = 0, dot = 0;
+        for (int i = 0; i < 4; ++i)
+            le += e[i] * e[i], lf += f[i] * f[i], dot += e[i] * f[i];
+        if (!(le > 0) || !(lf > 0))
+            return le == lf;
+        for (int i = 0; i < 4; ++i)
+            e[i] /= std::sqrt(le), f[i] /= std::sqrt(lf) * (dot < 0 ? -1 : 1);
+    }
+    for (int i = 0; i < n; ++i)
+        if (!(std::abs(e[i] - f[i]) <= 1e-4 * std::max(1.0, std::abs(e[i]))))
+            return std::isnan(e[i]) && std::isnan(f[i]);
+    return true;
+}
+
+int checkPoses(const char* path, const aiScene& scene) {
+    // Names that more than one source node carries cannot be told apart.
+    std::map<std::string, int> nameCount;
+    std::vector<const aiNode*> pending{scene.mRootNode};
+    for (std::size_t i = 0; i < pending.size() && pending.size() < 1000000; ++i) {
+        ++nameCount[pending[i]->mName.C_Str()];
+        for (unsigned c = 0; pending[i]->mChildren && c < pending[i]->mNumChildren; ++c)
+            if (pending[i]->mChildren[c])
+                pending.push_back(pending[i]->mChildren[c]);
+    }
+    const auto tracks = animatedTracks(scene);
+    std::ifstream in(path);
+    std::string line;
+    std::int64_t ticks = 0;
+    std::map<std::string, std::array<double, 10>> poses;
+    std::size_t checked = 0, failed = 0;
+    auto judge = [&] {
+        for (const auto& [key, track] : tracks) {
+            const auto& [name, attribute] = key;
+            const auto pose = poses.find(name);
+            if (name.empty() || nameCount[name] != 1 || pose == poses.end())
+                continue;
+            static const int offset[] = {0, 3, 7}, width[] = {3, 4, 3};
+            ++checked;
+            if (!close(play(track, ticks), pose->second.data() + offset[attribute],
+                       width[attribute], track.rotation)) {
+                if (++failed <= 5)
+                    std::printf("playback: %s attribute %d differs at %.9g s\n", name.c_str(),
+                                attribute, double(ticks) / ticksPerSecond);
+            }
+        }
+        poses.clear();
+    };
+    bool started = false;
+    while (std::getline(in, line)) {
+        if (line.rfind("time ", 0) == 0) {
+            if (started)
+                judge();
+            started = true;
+            ticks = std::llround(std::stod(line.substr(5)) * ticksPerSecond);
+            continue;
+        }
+        const std::size_t space = line.find(' ');
+        if (space == std::string::npos)
+            continue;
+        std::array<double, 10> values{};
+        std::istringstream numbers(line.substr(space + 1));
+        for (double& v : values)
+            numbers >> v;
+        // A name listed twice (made unique by the host) is not compared.
+        const std::string name = line.substr(0, space);
+        if (!poses.emplace(name, values).second)
+            nameCount[name] = 2;
+    }
+    if (started)
+        judge();
+    std::printf("playback: %zu checked, %zu differ\n", checked, failed);
+    return failed ? 6 : 0;
+}
+
 } // namespace
 
 int main(int argc, char** argv) {
-    if (argc < 2 || argc > 4) {
-        std::fputs("usage: assimp-reference MODEL [DOCUMENT.json [LISTING]]\n", stderr);
+    const bool poses = argc == 4 && std::string_view(argv[1]) == "--poses";
+    if (!poses && (argc < 2 || argc > 4)) {
+        std::fputs("usage: assimp-reference MODEL [DOCUMENT.json [LISTING]]\n"
+                   "       assimp-reference --poses MODEL POSES.txt\n",
+                   stderr);
         return 2;
     }
     try {
         Assimp::Importer importer;
-        const aiScene* scene = importer.ReadFile(argv[1], defaultFlags);
+        const aiScene* scene = importer.ReadFile(argv[poses ? 2 : 1], defaultFlags);
         if (!scene || !scene->mRootNode)
             return 1;
-        const int document = argc >= 3 ? checkDocument(argv[2], *scene) : 0;
+        if (poses)
+            return checkPoses(argv[3], *scene);
+        if (argc < 3)
+            return 0;
+        const int document = checkDocument(argv[2], *scene);
         const int frames = argc == 4 ? checkCamerasAndLights(argv[1], argv[3], *scene) : 0;
+        if (const std::vector<double> times = playbackTimes(*scene); !times.empty()) {
+            std::fputs("playback-times:", stdout);
+            for (double t : times)
+                std::printf(" %.17g", t);
+            std::fputs("\n", stdout);
+        }
         return document ? document : frames;
     } catch (const std::bad_alloc&) {
         // An allocation cap hit counts as a rejection, as assimp's own would.

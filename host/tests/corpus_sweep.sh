@@ -44,6 +44,18 @@ export LSAN_OPTIONS="${LSAN_OPTIONS:+$LSAN_OPTIONS:}use_tls=0:suppressions=$(dir
 export UBSAN_OPTIONS="${UBSAN_OPTIONS:+$UBSAN_OPTIONS:}halt_on_error=1:print_stacktrace=1:exitcode=87"
 
 # One file: prints "verdict<TAB>host code<TAB>reference code<TAB>file<TAB>detail".
+# Plays a file with node animations at the times the reference chose and lets
+# the reference compare every animated node's pose with assimp's keys.
+# Prints the reference's summary; fails when a pose differs or the run breaks.
+playback_one() {
+    local file=$1 times=$2 poses=$3
+    # shellcheck disable=SC2086 # the times are separate arguments
+    timeout -k 10 "$limit" "$host" -q "$file" --time $times --list poses \
+        >"$poses" 2>/dev/null || { echo "playback: host failed ($?)"; return 1; }
+    timeout -k 10 "$limit" "$reference" --poses "$file" "$poses" 2>&1
+}
+export -f playback_one
+
 sweep_one() {
     local file=$1 rel=${1#"$corpus"/}
     local out json err
@@ -82,6 +94,16 @@ sweep_one() {
         verdict=mesh-mismatch
     elif [ $hc -eq 0 ] && [ $rc -eq 6 ]; then
         verdict=frame-mismatch
+    elif [ $hc -eq 0 ] && [[ "$detail" == *"playback-times:"* ]]; then
+        local times=${detail##*playback-times: }
+        times=${times%%$'\n'*}
+        local played
+        if played=$(playback_one "$file" "$times" "$out/poses"); then
+            verdict=imported
+        else
+            verdict=playback-mismatch
+        fi
+        detail="${detail%%playback-times:*} $played"
     elif [ $hc -eq 0 ]; then
         verdict=imported
     else
@@ -138,7 +160,7 @@ seconds=$(($(date +%s) - start))
 count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
 imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json) +
-    $(count frame-mismatch)))
+    $(count frame-mismatch) + $(count playback-mismatch)))
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
@@ -150,6 +172,8 @@ framediff=$(count frame-mismatch)
 # "frames: cameras N lights M ..." of every imported file, summed.
 read -r cameras lights < <(grep -o 'frames: cameras [0-9]* lights [0-9]*' "$work/results" |
     awk '{c += $3; l += $5} END {print c + 0, l + 0}')
+playdiff=$(count playback-mismatch)
+played=$(grep -c 'playback: [0-9]* checked' "$work/results")
 
 awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
     while IFS=$'\t' read -r verdict hc rc rel detail; do
@@ -159,6 +183,6 @@ echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
      "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
      "cameras $cameras, lights $lights, camera/light frame mismatches $framediff," \
-     "seconds $seconds"
+     "animated files played $played, playback mismatches $playdiff, seconds $seconds"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff)) -eq 0 ]
+[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff + playdiff)) -eq 0 ]

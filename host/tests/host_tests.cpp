@@ -172,6 +172,35 @@ TEST_F(HostTest, SummaryOfTheSampleUnlessWritingAFile) {
     EXPECT_TRUE(!doc.HasParseError() && doc.IsObject());
 }
 
+// The sample's "Bend" animation lifts Pivot from y 0 to 0.5 and back over 1 s.
+TEST_F(HostTest, AnimationPlaysAtTimesAndSamplesFrames) {
+    HostRun r = run({"{sample}", "--time", "0.5", "--list", "poses"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    EXPECT_NE(r.out.find("\nPivot 2 0.5 0 "), std::string::npos) << r.out;
+    EXPECT_NE(r.err.find("animation: 2 clips, 1 layers, 12 channels, 0 s to 1 s"),
+              std::string::npos)
+        << r.err;
+
+    r = run({"-q", "{sample}", "--time", "0", "0.25", "--list", "nodes"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    EXPECT_NE(r.out.find("time 0\n"), std::string::npos);
+    EXPECT_NE(r.out.find("time 0.25\nRoot 0 0.5 0\nPivot 2 0.75 0\n"), std::string::npos) << r.out;
+
+    r = run({"-q", "{sample}", "--frames", "3"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    rapidjson::Document doc;
+    doc.Parse(r.out.c_str(), r.out.size());
+    ASSERT_TRUE(!doc.HasParseError() && doc.IsObject()) << r.out;
+    ASSERT_EQ(doc["frames"].Size(), 3u);
+    const auto& middle = doc["frames"][1];
+    EXPECT_DOUBLE_EQ(middle["time"].GetDouble(), 0.5);
+    EXPECT_NEAR(middle["nodes"]["Pivot"][10].GetDouble(), 1.0, 1e-6); // world y
+    EXPECT_TRUE(middle["nodes"].HasMember("Bone1"));
+    EXPECT_FALSE(middle["nodes"].HasMember("Box"));
+
+    EXPECT_EQ(run({"{sample}", "--list", "shapes"}).code, 2);
+}
+
 TEST_F(HostTest, JsonToStandardOutputParsesAndCarriesTheUpAxis) {
     rapidjson::Document doc;
     ASSERT_NO_FATAL_FAILURE(document({"-upAxis", "z", "{sample}"}, doc));

@@ -341,14 +341,75 @@ SCENE_PLAIN_INTERFACE(IRenderOutput, ::base::IPlugin, renderOutput_schema)
 
 SCENE_PLAIN_INTERFACE(IAnimClip, ::base::IPlugin, animClip_schema)
 
-// Listens to the clips and channels it plays.
+// Plays the clips of its "actions" at its "time" (scene_animation.cpp): item j
+// of "outputs" holds the value of channel j (the channels of all actions
+// counted in order), so an attribute linked to that item reads the animated
+// value. Reading an output through a link evaluates the layer when its time
+// or its clips changed since the last evaluation; evaluate() forces one. The
+// layer listens to the clips and channels it plays and rebuilds its clip list
+// when one of them, or its "actions", reports a change.
 class IAnimLayer : public ::base::IPlugin, public ::base::PluginCallback, public animLayer_schema {
-    SCENE_INTERFACE_MEMBERS(::base::IPlugin)
+public:
+    IAnimLayer(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory, std::uint32_t id);
+    ~IAnimLayer() override;
+    using ::base::IPlugin::data;
+    using ::base::IPlugin::name;
+    using ::base::IPlugin::size;
+    using ::base::IPlugin::typeName;
+
+    // Computes every channel at the current "time" and stores the results in
+    // "outputs". Problems are logged; their outputs keep their last value.
+    void evaluate();
+
     void pluginChanged(::base::IPlugin& plugin, ::base::name_id attribute, std::uint32_t kind,
                        std::uint64_t identifier) override;
+    void attributeChanged(::base::name_id name, ::base::Attribute* attribute,
+                          std::uint32_t flags) override;
+    void refreshPath(::base::AttribPath& path, ::base::name_id expectedType) override;
+
+    struct Playback;
+
+private:
+    Playback* m_playback;
 };
 
-SCENE_PLAIN_INTERFACE(IKeyframeChannel, ::base::IPlugin, keyframeChannel_schema)
+// One animated value. Each curve of "curves" holds keys whose "values" are of
+// the value type T the channel is evaluated for: int, float, double, quatf,
+// quatd and the float and double vectors of 2 to 4 components
+// (scene_animation.cpp instantiates exactly these).
+class IKeyframeChannel : public ::base::IPlugin, public keyframeChannel_schema {
+public:
+    IKeyframeChannel(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
+                     std::uint32_t id);
+    ~IKeyframeChannel() override;
+    using ::base::IPlugin::data;
+    using ::base::IPlugin::name;
+    using ::base::IPlugin::size;
+    using ::base::IPlugin::typeName;
+
+    // The value of curve 'curve' at 'time'; the zero value when nothing can be
+    // computed (the reason is logged). An interpolation mode outside 0..3
+    // throws base::switch_exception.
+    template <class T>
+    T computeValue(std::uint32_t curve, ::base::TimeCode time) const;
+
+    // Puts a key into curve 'curve' (replacing the value of a key at the same
+    // time), creating "times" and "values" when absent. False, logged, when
+    // the channel has no curves or the curve holds values of another type.
+    template <class T>
+    bool setKey(std::uint32_t curve, ::base::TimeCode time, const T& value);
+
+    // Forgets what was learnt about the curves (their order checks).
+    void attributeChanged(::base::name_id name, ::base::Attribute* attribute,
+                          std::uint32_t flags) override;
+
+    struct Memo;
+
+private:
+    // Per curve: whether its "times" were found ascending, and the last
+    // segment found (playback reads neighbouring times).
+    Memo* m_memo;
+};
 
 #undef SCENE_PLAIN_INTERFACE
 

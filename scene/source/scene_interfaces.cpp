@@ -22,9 +22,7 @@ base::name_id IHierarchical::interfaceName() {
 
 // INode lives in scene_node.cpp.
 
-// ---- Listeners ----
-
-void IAnimLayer::pluginChanged(::base::IPlugin&, ::base::name_id, std::uint32_t, std::uint64_t) {}
+// IAnimLayer and IKeyframeChannel live in scene_animation.cpp.
 
 // ---- IMaterial ----
 
