@@ -4,7 +4,8 @@
 #   - the host never crashes, hangs or leaks (sanitizer reports fail it),
 #   - it exits 0 exactly when assimp itself reads the file with the same flags,
 #   - its JSON document parses and, once it holds meshes, the meshes that
-#     assimp's nodes reference appear with assimp's vertex and face counts.
+#     assimp's nodes reference appear with assimp's vertex and face counts,
+#   - every material but assimp's default one is there with its textures.
 #
 # usage: corpus_sweep.sh SCENE_IMPORT ASSIMP_REFERENCE CORPUS_DIR
 # Environment: SWEEP_JOBS (2), SWEEP_TIMEOUT seconds per file (300),
@@ -77,6 +78,8 @@ sweep_one() {
         verdict=mesh-unstable
     elif [ $hc -eq 0 ] && [ $rc -eq 4 ]; then
         verdict=mesh-mismatch
+    elif [ $hc -eq 0 ] && [ $rc -eq 6 ]; then
+        verdict=material-mismatch
     elif [ $hc -eq 0 ]; then
         verdict=imported
     else
@@ -132,13 +135,15 @@ seconds=$(($(date +%s) - start))
 
 count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
-imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json)))
+imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json) + $(count material-mismatch)))
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
 hangs=$(($(count hang) + $(count reference-hang)))
 badjson=$(count bad-json)
 meshdiff=$(count mesh-mismatch)
+materialdiff=$(count material-mismatch)
+materialschecked=$(grep -c 'materials: [0-9]* expected' "$work/results")
 checked=$(grep -c $'\tmeshes: [0-9]* match' "$work/results")
 
 awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
@@ -147,6 +152,7 @@ awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
     done
 echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
-     "mesh counts checked $checked, mesh-count mismatches $meshdiff, seconds $seconds"
+     "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
+     "materials checked $materialschecked, material mismatches $materialdiff, seconds $seconds"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff)) -eq 0 ]
+[ $((mismatches + crashes + hangs + badjson + meshdiff + materialdiff)) -eq 0 ]
