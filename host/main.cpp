@@ -16,6 +16,7 @@
 #include "scene_stats.h"
 #include "stdout_stream.h"
 #include "stream/b_fs.h"
+#include "texture_extract.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -218,6 +219,7 @@ ValidationResult validateMeshes(const base::PluginFactory& factory) {
 int run(int argc, char** argv, HostLog& hostLog) {
     base::CmdLineOptions options;
     const HostSwitches switches = registerSwitches(options);
+    const auto* extractTextures = host::registerExtractTextures(options);
     base::string error;
     base::vector<base::string> positional;
     if (!options.parse(argc, argv, error, &positional))
@@ -343,6 +345,9 @@ int run(int argc, char** argv, HostLog& hostLog) {
         if (!written)
             return failure(base::format("writing '{}' failed", toStdout ? "<stdout>" : *output));
     }
+
+    if (host::runExtractTextures(extractTextures, *factory, toStdout ? stderr : stdout))
+        code = exitFailed;
 
     if (wantSummary) {
         const base::string text = host::formatSummary(host::collectStats(*factory), seconds);

@@ -4,7 +4,7 @@
 set -euo pipefail
 
 packages=(cmake g++ make libassimp-dev assimp-utils assimp-testmodels rapidjson-dev
-          libpugixml-dev googletest libgtest-dev libbenchmark-dev)
+          libpugixml-dev googletest libgtest-dev libbenchmark-dev libpng-dev)
 
 missing=()
 for p in "${packages[@]}"; do
