@@ -115,6 +115,26 @@ inline bool holds(const base::AttribMap& object, base::name_id name) {
     return object.findEntry(name) != nullptr;
 }
 
+// glTF's packed metal-rough image on a material: two texture objects over
+// one file, reading blue and green in linear space, the metal one scaled by
+// the metallic factor.
+inline void expectPackedMaps(const base::IPlugin& material, const char* file, float metallic) {
+    const PluginRef metal = plugin(material, names::metalMap);
+    const PluginRef rough = plugin(material, names::roughnessMap);
+    ASSERT_TRUE(metal && rough);
+    EXPECT_NE(metal.get(), rough.get());
+    EXPECT_EQ(text(*metal, names::file), file);
+    EXPECT_EQ(text(*rough, names::file), file);
+    EXPECT_EQ(value<std::uint8_t>(*metal, names::colorChannels), 5);
+    EXPECT_EQ(value<std::uint8_t>(*rough, names::colorChannels), 4);
+    EXPECT_EQ(value<std::uint8_t>(*metal, names::colorSpace), 1);
+    EXPECT_EQ(value<std::uint8_t>(*rough, names::colorSpace), 1);
+    const base::vec3f gain = value<base::vec3f>(*metal, names::colorGain);
+    EXPECT_EQ(gain.x, metallic);
+    EXPECT_EQ(gain.z, metallic);
+    EXPECT_FALSE(holds(*rough, names::colorGain));
+}
+
 // A factory, an importer, a captured log and a scene whose materials and
 // textures are converted one by one.
 class MaterialTest : public meshtest::MeshTest {

@@ -309,20 +309,7 @@ TEST_F(MaterialTest, MetalRoughMode) {
     EXPECT_EQ(captured.count("assimp import gltf| Specular-glossiness material attributes are "
                              "not currently supported. Will use metallic-roughness if present."),
               1u);
-    const PluginRef metal = plugin(*gltf, names::metalMap);
-    const PluginRef rough = plugin(*gltf, names::roughnessMap);
-    ASSERT_TRUE(metal && rough);
-    EXPECT_NE(metal.get(), rough.get());
-    EXPECT_EQ(text(*metal, names::file), "mr.png");
-    EXPECT_EQ(text(*rough, names::file), "mr.png");
-    EXPECT_EQ(value<std::uint8_t>(*metal, names::colorChannels), 5);
-    EXPECT_EQ(value<std::uint8_t>(*rough, names::colorChannels), 4);
-    EXPECT_EQ(value<std::uint8_t>(*metal, names::colorSpace), 1);
-    EXPECT_EQ(value<std::uint8_t>(*rough, names::colorSpace), 1);
-    const base::vec3f gain = value<base::vec3f>(*metal, names::colorGain);
-    EXPECT_EQ(gain.x, 0.25f);
-    EXPECT_EQ(gain.z, 0.25f);
-    EXPECT_FALSE(holds(*rough, names::colorGain));
+    expectPackedMaps(*gltf, "mr.png", 0.25f);
     EXPECT_EQ(value<float>(*gltf, names::roughness), 0.6f);
     EXPECT_EQ(mapFile(*gltf, names::colorMap), "base.png");
     const PluginRef occlusion = plugin(*gltf, names::ambientMap);
