@@ -1,6 +1,8 @@
 // Materials and textures through whole imports of models the tests write
 // (glTF, OBJ with MTL) and of a corpus FBX that embeds its image.
 #include "as_material_fixture.h"
+#include "b_json.h"
+#include "stream/b_stream.h"
 
 #include <filesystem>
 #include <fstream>
@@ -215,6 +217,20 @@ TEST_F(MaterialImport, FbxEmbedsItsImageByFileName) {
     EXPECT_EQ(objectsOf(names::buffer).size(), 1u);
     // Shininess 2 with strength 1: sqrt(2 / 4).
     EXPECT_NEAR(value<float>(*materials[0], names::roughness), 0.7071f, 1e-4);
+
+    // Written as JSON and read back, the texture reaches the image again
+    // through the adapter's view of the buffer.
+    base::Stream out = base::memoryStream();
+    ASSERT_TRUE(base::writeFactory(*factory, out));
+    const auto& document = static_cast<base::MemoryStreamWorker*>(out.worker())->bytes();
+    base::ref<base::PluginFactory> copy = as::meshtest::loadedFactory("copy");
+    base::Stream in = base::memoryStream("doc", document);
+    ASSERT_TRUE(base::readFactory(*copy, in));
+    const auto read = as::meshtest::objectsOf(*copy, names::fileTexture);
+    ASSERT_EQ(read.size(), 1u);
+    const auto* readBytes = read[0]->findVecAttribute<std::uint8_t>(names::embeddedFile);
+    ASSERT_NE(readBytes, nullptr);
+    EXPECT_EQ(*readBytes, *bytes);
 }
 
 } // namespace
