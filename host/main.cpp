@@ -19,6 +19,7 @@
 #include "scene_stats.h"
 #include "stdout_stream.h"
 #include "stream/b_fs.h"
+#include "texture_extract.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -230,6 +231,7 @@ int run(int argc, char** argv, HostLog& hostLog) {
     base::CmdLineOptions options;
     const HostSwitches switches = registerSwitches(options);
     const host::AnimationSwitches animation = host::registerAnimationSwitches(options);
+    const auto* extractTextures = host::registerExtractTextures(options);
     base::string error;
     base::vector<base::string> positional;
     if (!options.parse(argc, argv, error, &positional))
@@ -378,6 +380,8 @@ int run(int argc, char** argv, HostLog& hostLog) {
     // (on standard error when the scene itself goes to standard output).
     const base::string report = host::animationReport(*factory, animation, listed);
     std::fwrite(report.data(), 1, report.size(), toStdout ? stderr : stdout);
+    if (host::runExtractTextures(extractTextures, *factory, toStdout ? stderr : stdout))
+        code = exitFailed;
 
     if (wantSummary) {
         const base::string text = host::formatSummary(host::collectStats(*factory), seconds) +

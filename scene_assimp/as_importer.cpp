@@ -288,8 +288,9 @@ void AssimpImporter::convert(const aiScene* source, const base::string& path) {
 
     TextureList embeddedTextures(source->mNumTextures);
 
-    // Materials are converted here, by source index into m_materials, before
-    // the nodes: the meshes read them.
+    // Before the nodes: the meshes read the materials by source index.
+    for (std::uint32_t i = 0; source->mMaterials && i < source->mNumMaterials; ++i)
+        m_materials[i] = importMaterial(source, source->mMaterials[i], embeddedTextures);
 
     base::ref<scene::INode> root = importNode(source, source->mRootNode, embeddedTextures);
     if (root) {

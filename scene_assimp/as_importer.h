@@ -25,6 +25,7 @@ struct aiMesh;
 struct aiCamera;
 struct aiLight;
 struct aiString;
+struct aiMaterial;
 namespace Assimp {
 class Importer;
 }
@@ -76,6 +77,7 @@ private:
     friend struct NodeTestAccess;
     friend struct CameraLightTestAccess;
     friend struct AnimationTestAccess;
+    friend struct MaterialTestAccess;
 
     using TextureList = base::vector<base::ref<scene::IBufferAdapter>>;
     using NodeMap = base::map<base::string, base::ref<scene::INode>>;
@@ -85,6 +87,15 @@ private:
                                        TextureList& embeddedTextures);
     // Converts one mesh, once per import; a mesh with bones becomes a skin (as_mesh.cpp).
     base::ref<scene::IGeometry> importMesh(const aiScene* scene, aiMesh* mesh,
+                                           TextureList& embeddedTextures);
+    // One source material as a "principalMaterial" with its textures; null
+    // for assimp's default material (as_material.cpp).
+    base::ref<scene::IMaterial> importMaterial(const aiScene* scene, const aiMaterial* material,
+                                               TextureList& embeddedTextures);
+    // The texture of 'material' at (type, index) as a new texture object, or
+    // null when there is none or it cannot be read (as_texture.cpp).
+    base::ref<base::IPlugin> importTexture(const aiScene* scene, const aiMaterial* material,
+                                           unsigned type, unsigned index,
                                            TextureList& embeddedTextures);
     // Binds the joints of every skin to the nodes of the scene (as_skin.cpp).
     void resolveJoints(const aiScene* scene, const NodeMap& nodesByName);

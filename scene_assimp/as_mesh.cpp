@@ -12,6 +12,7 @@
 #include "b_plugin_attribute.h"
 #include "scene_schema.h"
 
+#include <assimp/material.h>
 #include <assimp/mesh.h>
 #include <assimp/scene.h>
 
@@ -155,10 +156,6 @@ void takeColorSets(scene::IMesh& mesh, aiMesh& source) {
 
 base::ref<scene::IGeometry> AssimpImporter::importMesh(const aiScene* scene, aiMesh* source,
                                                        TextureList& embeddedTextures) {
-    // The scene and the texture list serve the displacement lookup, which
-    // comes with the texture conversion.
-    (void)scene;
-    (void)embeddedTextures;
     if (!source || !m_factory)
         return {};
     const auto indexed = m_meshIndex.find(source);
@@ -186,8 +183,17 @@ base::ref<scene::IGeometry> AssimpImporter::importMesh(const aiScene* scene, aiM
     if (materialIndex < m_materials.size() && m_materials[materialIndex]) {
         if (auto* materials = primitive.vecAttribute<base::ref<base::IPlugin>>(names::materials))
             materials->items().assign(1, base::ref<base::IPlugin>(m_materials[materialIndex]));
-        // The material's displacement map ("displace", "displaceMap") joins here
-        // once textures are converted; 'embeddedTextures' is only for that.
+        const aiMaterial* material =
+            scene && scene->mMaterials && materialIndex < scene->mNumMaterials
+                ? scene->mMaterials[materialIndex]
+                : nullptr;
+        if (material && aiGetMaterialTextureCount(material, aiTextureType_DISPLACEMENT) > 0) {
+            if (base::ref<base::IPlugin> map = importTexture(
+                    scene, material, aiTextureType_DISPLACEMENT, 0, embeddedTextures)) {
+                mesh->setAttribute(names::displace, true);
+                mesh->setAttribute(names::displaceMap, map);
+            }
+        }
     }
 
     const std::uint32_t vertexCount = source->mNumVertices;

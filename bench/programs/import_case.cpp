@@ -14,11 +14,13 @@
 //
 // Output, one line: "<case> seconds=<wall> cpu=<user+sys> peak_kib=<VmHWM> ..."
 // then counts that show what was read (assimp's vertices and faces, or the
-// factory's objects and meshes).
+// factory's objects and meshes) and, for the import, the peak of the host
+// heap over the import (what the conversion allocates at most).
 // --trace samples the resident memory every MS milliseconds on a second
 // thread and prints "trace <seconds> <kib>" lines to standard error, which
 // shows the phase where the peak is reached.
 #include "b_json.h"
+#include "b_memory.h"
 #include "b_plugin.h"
 #include "b_plugin_factory.h"
 #include "scene_importer.h"
@@ -166,6 +168,7 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     std::size_t objects = 0, meshes = 0;
     double seconds = 0, cpu = 0, importSeconds = 0, previewSeconds = 0;
     long peak = 0;
+    std::size_t heapPeak = 0;
     {
         base::ref<base::PluginFactory> factory(new base::PluginFactory("bench"));
         scene::register_scene_schema(*factory);
@@ -191,10 +194,16 @@ void runImport(const std::string& model, const std::string& modulePath, const st
         sceneImporter->describeOptions(*importer);
 
         trace.mark("import");
+        // The host heap holds everything the conversion makes (assimp's own
+        // memory is not in it): its peak over the import is what the
+        // conversion adds.
+        base::resetHeapPeak();
+        const std::size_t heapBefore = base::heapStats().liveBytes;
         const Clock::time_point importStart = Clock::now();
         if (!sceneImporter->import(*factory, base::string(model)))
             fail("the import of '" + model + "' failed");
         importSeconds = since(importStart);
+        heapPeak = base::heapStats().peakBytes - heapBefore;
 
         if (!preview.path.empty()) {
             trace.mark("preview");
@@ -237,11 +246,12 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     unload();
     dlclose(module);
     std::printf("%s seconds=%.4f cpu=%.4f peak_kib=%ld objects=%zu meshes=%zu import_seconds=%.4f "
-                "preview_seconds=%.4f\n",
+                "preview_seconds=%.4f heap_peak_kib=%zu\n",
                 !preview.path.empty() ? "preview"
                 : json.empty()        ? "import"
                                       : "json",
-                seconds, cpu, peak, objects, meshes, importSeconds, previewSeconds);
+                seconds, cpu, peak, objects, meshes, importSeconds, previewSeconds,
+                heapPeak / 1024);
 }
 
 } // namespace

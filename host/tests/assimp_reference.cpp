@@ -6,7 +6,9 @@
 // Given the host's JSON document as well, it checks the document: it must
 // parse, and when it holds "mesh" objects, the meshes referenced by assimp's
 // nodes must appear in it once each with assimp's vertex and face counts
-// (arrays the shared-array pool replaced by links are followed).
+// (arrays the shared-array pool replaced by links are followed); every
+// material but assimp's default one must be a "principalMaterial", with the
+// textures of its classic slots present.
 //
 // Given the host's listing of cameras and lights as well (scene-import --list
 // cameras,lights), it checks that each camera and light of assimp's scene is
@@ -28,11 +30,12 @@
 //   exit 0 read (and the document matches), 1 assimp rejects MODEL,
 //        4 mesh counts differ, 5 the document does not parse, 2 usage,
 //        6 a camera or light is missing or misplaced (or, with --poses,
-//        a played pose differs)
+//        a played pose differs), 7 materials or textures differ
 //
 // It links nothing of the project and is built without the sanitizers, so
 // it can run under an address-space cap.
 #include <assimp/Importer.hpp>
+#include <assimp/material.h>
 #include <assimp/postprocess.h>
 #include <assimp/scene.h>
 #include <rapidjson/document.h>
@@ -191,6 +194,86 @@ std::uint64_t faceCount(const Document& doc, const Value& mesh) {
     return faces;
 }
 
+int checkMeshes(const Document& doc, const aiScene& scene);
+
+// Every material but assimp's default one comes in as a "principalMaterial",
+// and every texture at index 0 of the classic slot types is there: a file
+// reference as a "fileTexture" naming that file (or its tail, once made
+// relative), each embedded image with a "buffer". Answers 6 otherwise.
+int checkMaterials(const Document& doc, const aiScene& scene) {
+    std::size_t expected = 0;
+    std::set<std::string> files;
+    std::set<unsigned> embedded;
+    const auto isEmbedded = [&scene](std::string_view path, unsigned& index) {
+        if (path.size() > 1 && path[0] == '*') {
+            if (path.find_first_not_of("0123456789", 1) != std::string_view::npos ||
+                path.size() > 11)
+                return false;
+            index = unsigned(std::stoul(std::string(path.substr(1))));
+            return index < scene.mNumTextures && scene.mTextures[index];
+        }
+        const auto [found, at] = scene.GetEmbeddedTextureAndIndex(std::string(path).c_str());
+        index = unsigned(at);
+        return found != nullptr;
+    };
+    for (unsigned m = 0; scene.mMaterials && m < scene.mNumMaterials; ++m) {
+        const aiMaterial* material = scene.mMaterials[m];
+        if (!material)
+            continue;
+        aiString name;
+        if (material->Get(AI_MATKEY_NAME, name) == aiReturn_SUCCESS &&
+            std::string_view(name.C_Str()) == AI_DEFAULT_MATERIAL_NAME)
+            continue;
+        ++expected;
+        for (const aiTextureType type :
+             {aiTextureType_DIFFUSE, aiTextureType_SPECULAR, aiTextureType_AMBIENT,
+              aiTextureType_EMISSIVE, aiTextureType_HEIGHT, aiTextureType_NORMALS,
+              aiTextureType_SHININESS, aiTextureType_OPACITY, aiTextureType_LIGHTMAP,
+              aiTextureType_REFLECTION}) {
+            aiString path;
+            if (material->GetTexture(type, 0, &path) != aiReturn_SUCCESS || path.length == 0)
+                continue;
+            const std::string_view text(path.data, path.length);
+            unsigned index = 0;
+            if (isEmbedded(text, index)) {
+                const aiTexture& image = *scene.mTextures[index];
+                const bool readable = image.pcData || (image.mWidth == 0 && image.mHeight == 0);
+                if (readable && std::uint64_t(image.mWidth) * image.mHeight < (1u << 30))
+                    embedded.insert(index);
+            } else if (!(text.size() > 1 && text[0] == '*')) {
+                files.emplace(text);
+            }
+        }
+    }
+
+    const std::size_t found = doc.objectsOfType("principalMaterial").size();
+    std::set<std::string> documented;
+    for (const Value* texture : doc.objectsOfType("fileTexture"))
+        if (const Value* file = doc.attribute(*texture, "file"); file && file->IsString())
+            documented.emplace(file->GetString(), file->GetStringLength());
+    std::size_t missing = 0;
+    for (std::string file : files) {
+        std::replace(file.begin(), file.end(), '\\', '/');
+        const bool there = std::any_of(documented.begin(), documented.end(), [&](auto& d) {
+            std::string tail = d;
+            std::replace(tail.begin(), tail.end(), '\\', '/');
+            return tail == file || (file.size() > tail.size() && file.ends_with("/" + tail));
+        });
+        if (!there) {
+            std::printf("texture missing: %s; ", file.c_str());
+            ++missing;
+        }
+    }
+    const std::size_t buffers = doc.objectsOfType("buffer").size();
+    std::printf("materials: %zu expected, %zu found; textures: %zu files, %zu missing; embedded "
+                "images: %zu referenced, %zu buffers\n",
+                expected, found, files.size(), missing, embedded.size(), buffers);
+    // Images reached only through other texture types (glTF's packed image,
+    // displacement maps) have buffers too, but never more than the scene holds.
+    const bool imagesThere = buffers >= embedded.size() && buffers <= scene.mNumTextures;
+    return expected == found && missing == 0 && imagesThere ? 0 : 7;
+}
+
 int checkDocument(const char* path, const aiScene& scene) {
     std::ifstream in(path, std::ios::binary);
     std::stringstream text;
@@ -204,6 +287,12 @@ int checkDocument(const char* path, const aiScene& scene) {
         return 5;
     }
     const Document doc(parsed);
+    const int meshes = checkMeshes(doc, scene);
+    const int materials = checkMaterials(doc, scene);
+    return meshes ? meshes : materials;
+}
+
+int checkMeshes(const Document& doc, const aiScene& scene) {
     const std::vector<const Value*> meshes = doc.objectsOfType("mesh");
     if (meshes.empty()) {
         std::puts("meshes: none in the document, not compared");

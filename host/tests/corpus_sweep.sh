@@ -6,7 +6,10 @@
 #   - its JSON document parses and, once it holds meshes, the meshes that
 #     assimp's nodes reference appear with assimp's vertex and face counts,
 #   - its cameras and lights (scene-import --list) sit at the world positions
-#     and look along the directions that assimp's scene implies.
+#     and look along the directions that assimp's scene implies,
+#   - every material but assimp's default one is there with its textures,
+#   - animated nodes, played at five times per animation, take the poses
+#     that interpolating assimp's keys gives.
 #
 # usage: corpus_sweep.sh SCENE_IMPORT ASSIMP_REFERENCE CORPUS_DIR
 # Environment: SWEEP_JOBS (2), SWEEP_TIMEOUT seconds per file (300),
@@ -94,6 +97,8 @@ sweep_one() {
         verdict=mesh-mismatch
     elif [ $hc -eq 0 ] && [ $rc -eq 6 ]; then
         verdict=frame-mismatch
+    elif [ $hc -eq 0 ] && [ $rc -eq 7 ]; then
+        verdict=material-mismatch
     elif [ $hc -eq 0 ] && [[ "$detail" == *"playback-times:"* ]]; then
         local times=${detail##*playback-times: }
         times=${times%%$'\n'*}
@@ -160,13 +165,15 @@ seconds=$(($(date +%s) - start))
 count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
 imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json) +
-    $(count frame-mismatch) + $(count playback-mismatch)))
+    $(count frame-mismatch) + $(count playback-mismatch) + $(count material-mismatch)))
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
 hangs=$(($(count hang) + $(count reference-hang)))
 badjson=$(count bad-json)
 meshdiff=$(count mesh-mismatch)
+materialdiff=$(count material-mismatch)
+materialschecked=$(grep -c 'materials: [0-9]* expected' "$work/results")
 checked=$(grep -c $'\tmeshes: [0-9]* match' "$work/results")
 framediff=$(count frame-mismatch)
 # "frames: cameras N lights M ..." of every imported file, summed.
@@ -183,6 +190,7 @@ echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
      "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
      "cameras $cameras, lights $lights, camera/light frame mismatches $framediff," \
-     "animated files played $played, playback mismatches $playdiff, seconds $seconds"
+     "animated files played $played, playback mismatches $playdiff," \
+     "materials checked $materialschecked, material mismatches $materialdiff, seconds $seconds"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff + playdiff)) -eq 0 ]
+[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff + playdiff + materialdiff)) -eq 0 ]

@@ -240,8 +240,9 @@ SCENE_PLAIN_INTERFACE(IBuffer, ::base::IPlugin, buffer_schema)
 
 // Presents the byte range [inputOffset, inputOffset + inputLength) of the
 // "data" of its "inputBuffer" through the outputs that exist on it
-// (outputUint8 ... outputFloat4); it creates none. The outputs hold copies of
-// the bytes, so they stay valid whatever happens to the buffer. Each run
+// (outputUint8 ... outputFloat4); it creates none. Over a whole buffer,
+// outputUint8 is a view (a link to the buffer's "data", never dangling); the
+// other outputs and partial ranges hold copies of the bytes. Each run
 // listens to the buffer it read; a change the buffer reports (or one of the
 // adapter's inputs reported to pluginChanged) runs it again. Whoever sets the
 // inputs calls update().

@@ -1,9 +1,13 @@
 // The buffer adapter: typed outputs over a byte range of a buffer.
 //
-// The outputs are ordinary array attributes holding a copy of the range. The
-// base library's arrays always own their storage, and a copy cannot dangle
-// when the buffer reallocates its data or dies; each run replaces the whole
-// copy, so no output keeps bytes of an earlier run.
+// The byte output over a whole buffer (the case of every embedded image) is a
+// view: a link to the buffer's "data", so the bytes are held once and readers
+// always reach the buffer's current array (a replaced or reallocated "data" is
+// found again through the link; a dead buffer leaves the link unresolved,
+// never dangling). The other outputs, and the byte output over part of a
+// buffer, are copies of the range: the base library's arrays always own their
+// storage, so a sub-range or a reinterpretation cannot be presented in place.
+// Each run replaces the whole copy, so no output keeps bytes of an earlier run.
 #include "scene_getter.h"
 #include "scene_interfaces.h"
 
@@ -21,28 +25,55 @@ namespace {
 
 using PluginRef = ::base::ref<::base::IPlugin>;
 
+// The bytes one run presents.
+struct Range {
+    ::base::IPlugin* buffer;
+    const std::uint8_t* bytes; // the first byte of the range
+    std::size_t length;
+    bool whole; // the range is all of the buffer's data
+};
+
 // Refills the output 'name' when the adapter holds it as an array of T.
 template <class T>
-bool present(IBufferAdapter& adapter, ::base::name_id name, const std::uint8_t* bytes,
-             std::size_t length) {
+bool present(IBufferAdapter& adapter, ::base::name_id name, const Range& range) {
     ::base::Attribute* output = adapter.findEntry(name);
     if (!output || output->typeName() != ::base::TypeTraits<T>::n_array_name)
         return false;
-    ::base::ArrayOf<T> items(length / sizeof(T));
+    ::base::ArrayOf<T> items(range.length / sizeof(T));
     if (!items.empty())
-        std::memcpy(static_cast<void*>(items.data()), bytes, items.size() * sizeof(T));
+        std::memcpy(static_cast<void*>(items.data()), range.bytes, items.size() * sizeof(T));
     // Swapping gives back the old storage instead of keeping its capacity.
     static_cast<::base::TypedVectorAttribute<T>*>(output)->items().swap(items);
     return true;
 }
 
+// The byte output: a view of the whole buffer, else a copy of the range. A
+// link found there is the view of an earlier run.
+bool presentBytes(IBufferAdapter& adapter, ::base::name_id name, const Range& range) {
+    ::base::Attribute* output = adapter.findEntry(name);
+    if (!output)
+        return false;
+    if (range.whole) {
+        if (!output->asLink() &&
+            output->typeName() != ::base::TypeTraits<std::uint8_t>::n_array_name)
+            return false;
+        ::base::AttribPath path;
+        path.addPlugin(range.buffer).addMember(names::data);
+        adapter.attribute(name, new ::base::AttribLink(path));
+        return true;
+    }
+    if (output->asLink())
+        adapter.attribute(name, new ::base::TypedVectorAttribute<std::uint8_t>());
+    return present<std::uint8_t>(adapter, name, range);
+}
+
 // The outputs in the order they are filled and announced.
 struct Output {
     const ::base::name_id* name;
-    bool (*present)(IBufferAdapter&, ::base::name_id, const std::uint8_t*, std::size_t);
+    bool (*present)(IBufferAdapter&, ::base::name_id, const Range&);
 };
 constexpr Output outputs[] = {
-    {&names::outputUint8, &present<std::uint8_t>},
+    {&names::outputUint8, &presentBytes},
     {&names::outputUint16, &present<std::uint16_t>},
     {&names::outputUint32, &present<std::uint32_t>},
     {&names::outputFloat, &present<float>},
@@ -109,13 +140,13 @@ void IBufferAdapter::update(std::uint64_t stamp) {
     const std::size_t offset = std::min<std::size_t>(get(*this, names::inputOffset, 0u), size);
     const std::size_t length =
         std::min<std::size_t>(get(*this, names::inputLength, 0xFFFFFFFFu), size - offset);
-    const std::uint8_t* bytes = data->data() + offset;
+    const Range range{&buffer, data->data() + offset, length, offset == 0 && length == size};
 
     // Every output is filled before any listener hears of one: a listener
     // may change or drop the buffer, and its bytes must not be read after.
     bool filled[std::size(outputs)];
     for (std::size_t i = 0; i < std::size(outputs); ++i)
-        filled[i] = outputs[i].present(*this, *outputs[i].name, bytes, length);
+        filled[i] = outputs[i].present(*this, *outputs[i].name, range);
     for (std::size_t i = 0; i < std::size(outputs); ++i)
         if (filled[i])
             notify(*outputs[i].name, ::base::PluginCallback::changeKind, stamp);

@@ -67,11 +67,18 @@ struct Adapter : ::testing::Test {
             return TypeTraits<base::vec3f>::n_array_name;
         return TypeTraits<base::vec4f>::n_array_name;
     }
+    // Item counts as readers see them (the byte view followed to the buffer).
     std::vector<std::uint32_t> counts() const {
         std::vector<std::uint32_t> out;
-        for (name_id output : outputs())
-            out.push_back(adapter->findEntry(output)->size());
+        for (name_id output : outputs()) {
+            const base::Attribute* found = adapter->findOfType(output, arrayType(output));
+            out.push_back(found ? found->size() : 0);
+        }
         return out;
+    }
+    std::vector<std::uint32_t> copiedCounts() const {
+        std::vector<std::uint32_t> all = counts();
+        return std::vector<std::uint32_t>(all.begin() + 1, all.end());
     }
     const base::ArrayOf<std::uint8_t>& bytesOut() const {
         return *adapter->findVecAttribute<std::uint8_t>(names::outputUint8);
@@ -127,7 +134,9 @@ TEST_F(Adapter, MissingInputsLogOnceAndKeepTheOutputs) {
     adapter->update();
     EXPECT_EQ(log.messages(),
               (base::vector<base::string>{"bufferAdapter |ad| Missing `data` attribute in buf!"}));
-    EXPECT_EQ(counts(), before);
+    // The copies stay; the byte view shows the buffer, which has no data now.
+    EXPECT_EQ(copiedCounts(), std::vector<std::uint32_t>(before.begin() + 1, before.end()));
+    EXPECT_EQ(adapter->findVecAttribute<std::uint8_t>(names::outputUint8), nullptr);
 }
 
 TEST_F(Adapter, BufferChangesRunTheAdapterOncePerStamp) {
@@ -142,17 +151,20 @@ TEST_F(Adapter, BufferChangesRunTheAdapterOncePerStamp) {
     buffer->notify(names::data, base::PluginCallback::changeKind, stamp);
     ASSERT_EQ(bytesOut().size(), 16u);
     EXPECT_EQ(bytesOut()[15], 0xAB);
+    EXPECT_EQ(copiedCounts()[0], 8u);
     // One notification per output, carrying the buffer's stamp on.
     ASSERT_EQ(recorder.seen.size(), outputs().size());
     EXPECT_EQ(recorder.seen[0], std::make_pair(names::outputUint8, stamp));
 
-    // The same change arriving a second way is not run again.
+    // The same change arriving a second way is not run again: the copies
+    // keep the run's bytes while the byte view shows the buffer as it is.
     bytes.resize(3);
     buffer->notify(names::data, base::PluginCallback::changeKind, stamp);
-    EXPECT_EQ(bytesOut().size(), 16u);
+    EXPECT_EQ(copiedCounts()[0], 8u);
+    EXPECT_EQ(bytesOut().size(), 3u);
     buffer->notify(names::data, base::PluginCallback::changeKind,
                    base::PluginCallback::nextChangeStamp());
-    EXPECT_EQ(bytesOut().size(), 3u);
+    EXPECT_EQ(copiedCounts()[0], 1u);
 }
 
 TEST_F(Adapter, AnotherBufferReplacesTheOldOneSafely) {
@@ -166,13 +178,39 @@ TEST_F(Adapter, AnotherBufferReplacesTheOldOneSafely) {
     EXPECT_TRUE(other->hasListener(*adapter));
     EXPECT_EQ(bytesOut().size(), 2u);
 
-    // The outputs own their bytes: the buffer's death leaves them readable.
+    // The copies own their bytes; the byte view of a dead buffer resolves
+    // to nothing rather than to freed memory.
     adapter->removeAttribute(names::inputBuffer);
     other.reset();
-    EXPECT_EQ(bytesOut()[1], 2);
+    EXPECT_EQ(copiedCounts()[0], 1u);
+    EXPECT_EQ(adapter->findVecAttribute<std::uint8_t>(names::outputUint8), nullptr);
 }
 
-// A listener of the first output that shrinks the buffer: the outputs after
+// The byte output over a whole buffer holds no copy: it reads the buffer's
+// own array, also after the array is replaced; over part of the buffer it
+// is a copy, and a view again once the range covers everything.
+TEST_F(Adapter, ByteOutputIsAViewOfAWholeBuffer) {
+    adapter->setAttribute(names::inputBuffer, buffer);
+    adapter->update();
+    ASSERT_NE(adapter->findEntry(names::outputUint8)->asLink(), nullptr);
+    EXPECT_EQ(bytesOut().data(), buffer->findVecAttribute<std::uint8_t>(names::data)->data());
+
+    buffer->removeAttribute(names::data);
+    buffer->vecAttribute<std::uint8_t>(names::data)->items() = {5, 6, 7};
+    EXPECT_EQ(bytesOut(), (base::ArrayOf<std::uint8_t>{5, 6, 7}));
+
+    adapter->setAttribute(names::inputOffset, 1u);
+    adapter->update();
+    EXPECT_EQ(adapter->findEntry(names::outputUint8)->asLink(), nullptr);
+    EXPECT_EQ(bytesOut(), (base::ArrayOf<std::uint8_t>{6, 7}));
+    adapter->setAttribute(names::inputOffset, 0u);
+    adapter->setAttribute(names::inputLength, 3u);
+    adapter->update();
+    EXPECT_NE(adapter->findEntry(names::outputUint8)->asLink(), nullptr);
+    EXPECT_TRUE(log.messages().empty());
+}
+
+// A listener of the first output that shrinks the buffer: the copies after
 // it still hold the bytes of the run that announced them.
 TEST_F(Adapter, ListenersChangingTheBufferDoNotDisturbTheRun) {
     struct Shrinker : base::PluginCallback {
@@ -191,7 +229,8 @@ TEST_F(Adapter, ListenersChangingTheBufferDoNotDisturbTheRun) {
     adapter->setAttribute(names::inputBuffer, buffer);
     adapter->update();
     adapter->removeListener(shrinker);
-    EXPECT_EQ(counts(), (std::vector<std::uint32_t>{10, 5, 2, 2, 1, 0, 0}));
+    // The byte view shows the shrunk buffer; the copies hold the run's bytes.
+    EXPECT_EQ(counts(), (std::vector<std::uint32_t>{0, 5, 2, 2, 1, 0, 0}));
     const auto& floats = *adapter->findVecAttribute<base::vec2f>(names::outputFloat2);
     float expected;
     const std::uint8_t bytes[] = {0, 1, 2, 3};
