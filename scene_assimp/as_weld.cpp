@@ -93,24 +93,35 @@ private:
     const WeldInfluences& m_influences;
 };
 
-// A table slot: the first vertex of a record and 32 bits of its position's hash,
-// so that most probes are settled without reading the vertex.
+// A table slot: the first vertex of a record and the high 32 bits of its
+// position's hash. The slot index is the tag's top bits, so the table can
+// grow without reading a vertex, and most probes are settled by the tag.
 struct Slot {
     std::uint32_t vertex = noVertex;
     std::uint32_t tag = 0;
 };
 
+// Open addressing with linear probing, at most two thirds full. It grows
+// with the records found rather than being sized for every vertex: meshes
+// read per face repeat each vertex several times, and a small table stays
+// in cache.
 class Table {
 public:
-    explicit Table(std::uint32_t count)
-        : m_slots(std::bit_ceil(std::max<std::uint64_t>(16, count + count / 2))),
-          m_shift(64 - std::countr_zero(m_slots.size())), m_mask(m_slots.size() - 1) {}
+    explicit Table(std::uint32_t count) {
+        resize(std::bit_ceil(std::clamp<std::uint64_t>(count + count / 2, 16, 1u << 16)));
+    }
+
+    static std::uint32_t tagOf(std::uint64_t hash) { return std::uint32_t(hash >> 32); }
+
+    void prefetch(std::uint64_t hash) const {
+        __builtin_prefetch(&m_slots[tagOf(hash) >> m_shift]);
+    }
 
     // The earliest vertex of the position 'hash' for which 'same' holds.
     template <class Same>
     std::uint32_t find(std::uint64_t hash, Same&& same) const {
-        const auto tag = std::uint32_t(hash);
-        for (std::uint64_t i = hash >> m_shift;; i = (i + 1) & m_mask) {
+        const std::uint32_t tag = tagOf(hash);
+        for (std::size_t i = tag >> m_shift;; i = (i + 1) & m_mask) {
             const Slot& slot = m_slots[i];
             if (slot.vertex == noVertex)
                 return noVertex;
@@ -121,16 +132,40 @@ public:
     }
 
     void insert(std::uint64_t hash, std::uint32_t v) {
-        std::uint64_t i = hash >> m_shift;
-        while (m_slots[i].vertex != noVertex)
-            i = (i + 1) & m_mask;
-        m_slots[i] = {v, std::uint32_t(hash)};
+        if (3 * (m_used + 1) > 2 * m_slots.size())
+            resize(2 * m_slots.size());
+        place({v, tagOf(hash)});
+        ++m_used;
     }
 
 private:
-    base::vector<Slot> m_slots; // at most two thirds full, so probe runs stay short
-    int m_shift;
-    std::uint64_t m_mask;
+    void place(Slot slot) {
+        std::size_t i = slot.tag >> m_shift;
+        while (m_slots[i].vertex != noVertex)
+            i = (i + 1) & m_mask;
+        m_slots[i] = slot;
+    }
+
+    void resize(std::size_t size) {
+        base::vector<Slot> old(size);
+        old.swap(m_slots);
+        m_shift = 32 - std::countr_zero(size);
+        m_mask = size - 1;
+        // Entries of one position must keep their order: each run of full
+        // slots is walked in probe order, starting after an empty slot so
+        // that no run wraps around the walk's start.
+        std::size_t start = 0;
+        while (start < old.size() && old[start].vertex != noVertex)
+            ++start;
+        for (std::size_t n = 0; n < old.size(); ++n)
+            if (const Slot& slot = old[(start + n) & (old.size() - 1)]; slot.vertex != noVertex)
+                place(slot);
+    }
+
+    base::vector<Slot> m_slots;
+    std::size_t m_used = 0;
+    int m_shift = 32;
+    std::size_t m_mask = 0;
 };
 
 // The influences of every vertex, gathered from the bones. Answers false
@@ -208,13 +243,26 @@ std::uint32_t findDistinctVertices(std::span<const WeldStream> streams,
     const Records records(streams, influences);
     Table table(count);
 
+    // Hashes are worked out a few vertices ahead and their slots fetched, so
+    // the table's cache misses overlap instead of coming one by one.
+    constexpr std::uint32_t ahead = 16;
+    std::uint64_t hashes[ahead];
+    auto stage = [&](std::uint32_t v) {
+        hashes[v % ahead] = records.hash(v);
+        table.prefetch(hashes[v % ahead]);
+    };
+    for (std::uint32_t v = 0; v < std::min(ahead, count); ++v)
+        stage(v);
+
     std::uint32_t kept = 0;
     for (std::uint32_t v = 0; v < count; ++v) {
+        const std::uint64_t hash = hashes[v % ahead];
+        if (v + ahead < count)
+            stage(v + ahead);
         // A record holding a NaN fails every comparison, so it is never
         // found, not even by a copy of itself.
         if (remap[v] == weldUnused)
             continue;
-        const std::uint64_t hash = records.hash(v);
         const std::uint32_t match =
             table.find(hash, [&](std::uint32_t other) { return records.same(other, v); });
         if (match != noVertex) {

@@ -3,7 +3,11 @@
 #include "as_mesh_fixture.h"
 #include "as_weld.h"
 
+#include <assimp/Importer.hpp>
+#include <assimp/postprocess.h>
+
 #include <cmath>
+#include <filesystem>
 #include <functional>
 #include <limits>
 #include <memory>
@@ -191,6 +195,38 @@ TEST(Weld, SixteenMillionVerticesInOnePass) {
     compactStream(stream, remap);
     EXPECT_EQ(positions[3 * std::size_t(half - 1)], float((half - 1) & 4095));
     EXPECT_EQ(positions[3 * std::size_t(half - 1) + 1], float((half - 1) >> 12) * 0.25f);
+}
+
+// assimp generates smooth normals across positions, before its own join
+// would run, so welding an unjoined read must give the vertices of its joined
+// read exactly, generated normals included, in the same order.
+TEST(Weld, GivesAssimpsJoinedVerticesOnModelsWithoutNormals) {
+    const std::filesystem::path corpus = SCENE_CORPUS_DIR;
+    if (!std::filesystem::is_directory(corpus))
+        GTEST_SKIP() << corpus << " is missing";
+    constexpr unsigned smooth = aiProcess_GenSmoothNormals | aiProcess_FindInstances;
+    for (const char* file : {"AC/SphereWithLight.ac", "COB/dwarf.cob", "DXF/PinkEggFromLW.dxf",
+                             "OFF/Wuson.off", "OBJ/regr01.obj", "X3D/HelloX3dTrademark.x3d"}) {
+        SCOPED_TRACE(file);
+        Assimp::Importer plainImporter, joinedImporter;
+        const std::string path = (corpus / file).string();
+        const aiScene* plain = plainImporter.ReadFile(path, smooth);
+        const aiScene* joined =
+            joinedImporter.ReadFile(path, smooth | aiProcess_JoinIdenticalVertices);
+        ASSERT_TRUE(plain && joined);
+        ASSERT_EQ(plain->mNumMeshes, joined->mNumMeshes);
+        for (unsigned m = 0; m < plain->mNumMeshes; ++m) {
+            aiMesh& ours = *plain->mMeshes[m];
+            const aiMesh& theirs = *joined->mMeshes[m];
+            ASSERT_EQ(weldMesh(ours), theirs.mNumVertices);
+            ASSERT_TRUE(ours.mNormals && theirs.mNormals);
+            unsigned differing = 0;
+            for (unsigned v = 0; v < ours.mNumVertices; ++v)
+                differing += !(ours.mVertices[v] == theirs.mVertices[v]) ||
+                             !(ours.mNormals[v] == theirs.mNormals[v]);
+            EXPECT_EQ(differing, 0u) << "mesh " << m;
+        }
+    }
 }
 
 TEST_F(MeshTest, TheConversionWeldsBeforeItCopies) {
