@@ -103,12 +103,14 @@ struct Slot {
 
 // Open addressing with linear probing, at most two thirds full. It grows
 // with the records found rather than being sized for every vertex: meshes
-// read per face repeat each vertex several times, and a small table stays
-// in cache.
+// read per face repeat each vertex several times, and a smaller table
+// misses the cache less.
 class Table {
 public:
+    // Room for half the vertices: a mesh read per face needs no more, one
+    // read indexed grows once.
     explicit Table(std::uint32_t count) {
-        resize(std::bit_ceil(std::clamp<std::uint64_t>(count + count / 2, 16, 1u << 16)));
+        resize(std::bit_ceil(std::max<std::uint64_t>(16, count - count / 4)));
     }
 
     static std::uint32_t tagOf(std::uint64_t hash) { return std::uint32_t(hash >> 32); }
