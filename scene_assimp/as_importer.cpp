@@ -82,7 +82,8 @@ bool ImportFlags::removesComponents() const noexcept {
 ImportFlags importFlags(const base::AttribMap& options) {
     using S = scene::sceneImporter_schema;
     ImportFlags out;
-    out.flags = aiProcess_JoinIdenticalVertices | aiProcess_FindInstances;
+    // Identical vertices are joined by the mesh conversion, far faster than by assimp.
+    out.flags = aiProcess_FindInstances;
     auto remove = [&out](std::uint32_t component) {
         out.flags |= aiProcess_RemoveComponent;
         out.components |= component;

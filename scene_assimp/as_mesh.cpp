@@ -6,6 +6,7 @@
 // after, which keeps the peak close to one copy of the geometry.
 #include "as_mesh.h"
 #include "as_importer.h"
+#include "as_weld.h"
 
 #include "b_format.h"
 #include "b_log.h"
@@ -196,6 +197,9 @@ base::ref<scene::IGeometry> AssimpImporter::importMesh(const aiScene* scene, aiM
         }
     }
 
+    // assimp reads without joining identical vertices; they are joined here,
+    // before anything is copied.
+    weldMesh(*source);
     const std::uint32_t vertexCount = source->mNumVertices;
     if (vertexCount != 0) {
         takeStream<base::vec3f>(*mesh, names::positions, source->mVertices, vertexCount);

@@ -236,6 +236,17 @@ struct JSONAttrWriter::Impl
         // Enough for the longest shortest double (24 characters) and any integer.
         constexpr std::size_t room = 32;
         char* at = out.reserve(room);
+        if constexpr (std::is_floating_point_v<N>) {
+            // Whole numbers of up to five digits (positions on a grid, unit
+            // normals, texture borders) print as integers, several times
+            // faster: the shortest form is the plain digits there too, as
+            // the exponent form is never shorter. -0 keeps its sign.
+            if (value > -1e5 && value < 1e5 && value == N(std::int32_t(value)) &&
+                (value != 0 || !std::signbit(value))) {
+                out.commit(std::to_chars(at, at + room, std::int32_t(value)).ptr);
+                return afterValue();
+            }
+        }
         out.commit(std::to_chars(at, at + room, value).ptr);
         return afterValue();
     }

@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <charconv>
 #include <cmath>
 #include <cstring>
 #include <functional>
@@ -278,6 +279,42 @@ TEST(JsonNumbers, FloatsPrintShortestAndReadBackExactly) {
     TypedAttribute<float> nan;
     ASSERT_TRUE(fromJson(nan, "NaN"));
     EXPECT_TRUE(std::isnan(nan.value()));
+}
+
+TEST(JsonNumbers, WholeNumbersPrintAsTheShortestFormDoes) {
+    // Around the border of five digits, where the exponent form becomes the
+    // shorter one, and every whole number below it.
+    TypedVectorAttribute<float> floats;
+    TypedVectorAttribute<double> doubles;
+    for (int i = -100002; i <= 100002; ++i) {
+        floats.items().push_back(float(i));
+        doubles.items().push_back(double(i));
+    }
+    for (double d : {1e5, 1e6, 123456.0, 16777216.0, 99999.5, -0.0, 2147483648.0}) {
+        floats.items().push_back(float(d));
+        doubles.items().push_back(d);
+    }
+    auto expected = [](const auto& items) {
+        string text;
+        char buffer[32];
+        for (const auto& value : items) {
+            text.append(buffer, std::to_chars(buffer, buffer + sizeof buffer, value).ptr);
+            text += ' ';
+        }
+        return text;
+    };
+    // The items as written, one blank after each.
+    auto written = [](const Attribute& attribute) {
+        string text;
+        for (char c : toJson(attribute))
+            if (c == ',')
+                text += ' ';
+            else if (c != '[' && c != ']' && c != '\t' && c != '\n')
+                text += c;
+        return text + ' ';
+    };
+    EXPECT_EQ(written(floats), expected(floats.items()));
+    EXPECT_EQ(written(doubles), expected(doubles.items()));
 }
 
 TEST(JsonNumbers, DoublesAndIntegersReadBackExactly) {

@@ -2,15 +2,19 @@
 // time and the process's peak resident memory, so every case is measured in a
 // fresh process:
 //
-//   read    assimp's ReadFile alone, with the importer's default flags
-//   import  the whole import: scene types, module load, importer creation,
-//           option defaults, import into a factory
-//   json    the whole import, then the factory written as JSON to a file
-//   preview the whole import, then a preview image of the scene written as
-//           PNG (--preview OUT, default <model>.png); its time is printed apart
+//   read        assimp's ReadFile alone with assimp's own vertex join (the
+//               flags the importer used before it welded vertices itself)
+//   read-plain  assimp's ReadFile alone with the importer's default flags,
+//               which leave the join out
+//   import      the whole import: scene types, module load, importer
+//               creation, option defaults, import into a factory
+//   json        the whole import, then the factory written as JSON to a file
+//   preview     the whole import, then a preview image of the scene written
+//               as PNG (--preview OUT, default <model>.png); its time is
+//               printed apart
 //
-//   import_case <read|import|json|preview> <model> [--module PATH] [--json OUT]
-//               [--preview OUT] [--size N] [--trace MS]
+//   import_case <read|read-plain|import|json|preview> <model> [--module PATH]
+//               [--json OUT] [--preview OUT] [--size N] [--trace MS]
 //
 // Output, one line: "<case> seconds=<wall> cpu=<user+sys> peak_kib=<VmHWM> ..."
 // then counts that show what was read (assimp's vertices and faces, or the
@@ -53,10 +57,11 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-// The flag word the importer reads with when no option changes it.
-constexpr unsigned importerDefaultFlags =
-    aiProcess_JoinIdenticalVertices | aiProcess_GenSmoothNormals | aiProcess_FindInstances;
-static_assert(importerDefaultFlags == 0x100042);
+// The flag word the importer reads with when no option changes it, and the
+// same with assimp's vertex join.
+constexpr unsigned importerDefaultFlags = aiProcess_GenSmoothNormals | aiProcess_FindInstances;
+constexpr unsigned joinedFlags = importerDefaultFlags | aiProcess_JoinIdenticalVertices;
+static_assert(joinedFlags == 0x100042);
 
 long statusKib(const char* field) {
     std::ifstream status("/proc/self/status");
@@ -130,12 +135,12 @@ std::size_t countOfType(base::PluginFactory& factory, std::string_view type) {
     return count;
 }
 
-// Case "read".
-void runRead(const std::string& model, int tracePeriod) {
+// Cases "read" and "read-plain".
+void runRead(const std::string& which, const std::string& model, unsigned flags, int tracePeriod) {
     const Clock::time_point start = Clock::now();
     RssTrace trace(tracePeriod, start);
     Assimp::Importer importer;
-    const aiScene* scene = importer.ReadFile(model.c_str(), importerDefaultFlags);
+    const aiScene* scene = importer.ReadFile(model.c_str(), flags);
     const double seconds = since(start), cpu = cpuSeconds();
     const long peak = statusKib("VmHWM");
     trace.stop();
@@ -146,8 +151,8 @@ void runRead(const std::string& model, int tracePeriod) {
         vertices += scene->mMeshes[i]->mNumVertices;
         faces += scene->mMeshes[i]->mNumFaces;
     }
-    std::printf("read seconds=%.4f cpu=%.4f peak_kib=%ld meshes=%u vertices=%zu faces=%zu\n",
-                seconds, cpu, peak, scene->mNumMeshes, vertices, faces);
+    std::printf("%s seconds=%.4f cpu=%.4f peak_kib=%ld meshes=%u vertices=%zu faces=%zu\n",
+                which.c_str(), seconds, cpu, peak, scene->mNumMeshes, vertices, faces);
 }
 
 struct PreviewCase {
@@ -259,7 +264,7 @@ void runImport(const std::string& model, const std::string& modulePath, const st
 int main(int argc, char** argv) {
     if (argc < 3) {
         std::fprintf(stderr,
-                     "usage: %s <read|import|json|preview> <model> [--module PATH] "
+                     "usage: %s <read|read-plain|import|json|preview> <model> [--module PATH] "
                      "[--json OUT] [--preview OUT] [--size N] [--trace MS]\n",
                      argv[0]);
         return 2;
@@ -288,7 +293,9 @@ int main(int argc, char** argv) {
 
     try {
         if (which == "read")
-            runRead(model, tracePeriod);
+            runRead(which, model, joinedFlags, tracePeriod);
+        else if (which == "read-plain")
+            runRead(which, model, importerDefaultFlags, tracePeriod);
         else if (which == "import")
             runImport(model, modulePath, {}, tracePeriod);
         else if (which == "preview") {
