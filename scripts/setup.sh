@@ -4,7 +4,8 @@
 set -euo pipefail
 
 packages=(cmake g++ make libassimp-dev assimp-utils assimp-testmodels rapidjson-dev
-          libpugixml-dev googletest libgtest-dev libbenchmark-dev)
+          libpugixml-dev googletest libgtest-dev libbenchmark-dev pkg-config
+          libzip-dev zlib1g-dev liblz4-dev liblzma-dev libzstd-dev)
 
 missing=()
 for p in "${packages[@]}"; do
