@@ -8,43 +8,8 @@
 
 namespace host {
 
-namespace {
-
-bool readable(std::string_view path, std::string_view extensions) {
-    const std::size_t slash = path.find_last_of('/');
-    const std::string_view leaf = path.substr(slash == std::string_view::npos ? 0 : slash + 1);
-    const std::size_t dot = leaf.rfind('.');
-    if (dot == std::string_view::npos || dot == 0)
-        return false;
-    const base::string extension = [&] {
-        base::string e(leaf.substr(dot + 1));
-        for (char& c : e)
-            c = char(c >= 'A' && c <= 'Z' ? c + 32 : c);
-        return e;
-    }();
-    while (!extensions.empty()) {
-        const std::size_t end = extensions.find(';');
-        if (extensions.substr(0, end) == extension)
-            return true;
-        if (end == std::string_view::npos)
-            break;
-        extensions.remove_prefix(end + 1);
-    }
-    return false;
-}
-
-} // namespace
-
 bool insideArchive(const base::string& path) {
-    if (base::fs::innerName(path) != path)
-        return true;
-    for (std::size_t end = path.find_first_of("/\\"); end != base::string::npos;
-         end = path.find_first_of("/\\", end + 1)) {
-        const std::string_view folder(path.data(), end);
-        if (base::fs::isArchiveName(folder) || base::fs::innerName(folder).size() != folder.size())
-            return true;
-    }
-    return false;
+    return base::fs::innerName(path) != path || base::fs::archivesOnTheWay(path) > 0;
 }
 
 bool chooseArchiveModel(const base::PluginFactory& factory, base::name_id importerType,
@@ -57,7 +22,7 @@ bool chooseArchiveModel(const base::PluginFactory& factory, base::name_id import
     // Compressed members count by the name of their content.
     base::vector<base::string> models;
     for (const base::string& file : base::fs::listFilesBelow(model))
-        if (readable(base::fs::innerName(file), extensions))
+        if (base::fs::hasExtensionIn(base::fs::innerName(file), extensions))
             models.push_back(file);
     if (models.size() == 1) {
         model = models.front();

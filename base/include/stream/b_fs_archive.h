@@ -48,8 +48,16 @@ void attachArchiveFileSystems(MasterFS& master);
 // "dir/scan.ply.gz" gives "dir/scan.ply"; other paths come back unchanged.
 string innerName(std::string_view path);
 
+// Whether the extension of the path's last component is one of 'list'
+// ("zip;jar"), in any case.
+bool hasExtensionIn(std::string_view path, std::string_view list);
+
 // Whether the path's last component names a zip-like archive (by extension).
 bool isArchiveName(std::string_view path);
+
+// How many folders of the path are, by their names, archives or compressed
+// files ("a.zip/b.zip.gz/c.obj": 2).
+std::uint32_t archivesOnTheWay(std::string_view path);
 
 // The paths of every file inside 'folder' and its subfolders, through the
 // master file system, sorted; for an archive path, all its members.

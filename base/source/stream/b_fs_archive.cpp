@@ -78,8 +78,23 @@ string innerName(std::string_view path) {
     return string(path);
 }
 
+bool hasExtensionIn(std::string_view path, std::string_view list) {
+    return inList(list, extensionOf(path));
+}
+
 bool isArchiveName(std::string_view path) {
     return inList(zipFileSystem().extensions(), extensionOf(path));
+}
+
+std::uint32_t archivesOnTheWay(std::string_view path) {
+    std::uint32_t count = 0;
+    for (std::size_t end = path.find_first_of("/\\"); end != std::string_view::npos;
+         end = path.find_first_of("/\\", end + 1)) {
+        const std::string_view folder = path.substr(0, end);
+        if (isArchiveName(folder) || innerName(folder).size() != folder.size())
+            ++count;
+    }
+    return count;
 }
 
 vector<string> listFilesBelow(std::string_view folder) {

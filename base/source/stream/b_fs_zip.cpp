@@ -327,18 +327,6 @@ private:
                              "base::fs::ZipPlugin::open");
     }
 
-    // The folders of the path that name archives, compressed ones included.
-    static std::uint32_t archivesOnTheWay(std::string_view path) {
-        std::uint32_t count = 0;
-        for (std::size_t end = path.find_first_of("/\\"); end != std::string_view::npos;
-             end = path.find_first_of("/\\", end + 1)) {
-            const std::string_view folder = path.substr(0, end);
-            if (isArchiveName(folder) || innerName(folder).size() != folder.size())
-                ++count;
-        }
-        return count;
-    }
-
     vector<string> listing(std::string_view folder, std::string_view pattern, bool folders) {
         archive::NestingGuard guard;
         if (guard.tooDeep())
