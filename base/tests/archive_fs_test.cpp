@@ -204,6 +204,10 @@ std::string corrupt(const std::string& dir, const char* ext, std::function<void(
     return dir + "/d";
 }
 
+void halve(Bytes& b) {
+    b.erase(b.begin() + std::ptrdiff_t(b.size() / 2), b.end());
+}
+
 std::string zipWith(const std::string& dir, std::vector<archive_maker::Member> members,
                     std::function<void(Bytes&)> damage = {}) {
     archive_maker::writeZip(dir + "/bad.zip", members);
@@ -224,33 +228,10 @@ std::size_t centralEntry(const Bytes& zip) {
 }
 
 const BadInput badInputs[] = {
-    {"TruncatedGzip",
-     [](auto& d) {
-         return corrupt(
-             d, "gz", [](Bytes& b) { b.erase(b.begin() + std::ptrdiff_t(b.size() / 2), b.end()); });
-     },
-     "gzip fs| '"},
-    {"TruncatedLz4",
-     [](auto& d) {
-         return corrupt(d, "lz4", [](Bytes& b) {
-             b.erase(b.begin() + std::ptrdiff_t(b.size() / 2), b.end());
-         });
-     },
-     "is truncated"},
-    {"TruncatedLzma",
-     [](auto& d) {
-         return corrupt(d, "lzma", [](Bytes& b) {
-             b.erase(b.begin() + std::ptrdiff_t(b.size() / 2), b.end());
-         });
-     },
-     "lzma fs| '"},
-    {"TruncatedZst",
-     [](auto& d) {
-         return corrupt(d, "zst", [](Bytes& b) {
-             b.erase(b.begin() + std::ptrdiff_t(b.size() / 2), b.end());
-         });
-     },
-     "is truncated"},
+    {"TruncatedGzip", [](auto& d) { return corrupt(d, "gz", halve); }, "gzip fs| '"},
+    {"TruncatedLz4", [](auto& d) { return corrupt(d, "lz4", halve); }, "is truncated"},
+    {"TruncatedLzma", [](auto& d) { return corrupt(d, "lzma", halve); }, "lzma fs| '"},
+    {"TruncatedZst", [](auto& d) { return corrupt(d, "zst", halve); }, "is truncated"},
     {"GzipBadCrc", [](auto& d) { return corrupt(d, "gz", [](Bytes& b) { b[b.size() - 6] ^= 1; }); },
      "is corrupt"},
     {"Lz4BadChecksum",
@@ -323,6 +304,10 @@ const BadInput badInputs[] = {
      },
      "zip fs| Archives are nested too deeply in '"},
 };
+
+void PrintTo(const BadInput& input, std::ostream* out) {
+    *out << input.name;
+}
 
 class ArchiveBadInput : public ArchiveFS, public ::testing::WithParamInterface<BadInput> {};
 
