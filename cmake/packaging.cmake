@@ -61,7 +61,8 @@ set(CPACK_PACKAGING_INSTALL_PREFIX /usr)
 set(CPACK_DEBIAN_FILE_NAME DEB-DEFAULT)
 set(CPACK_DEBIAN_PACKAGE_SECTION libdevel)
 # Debian 12's runtime libraries the libraries, module and host link.
-set(CPACK_DEBIAN_PACKAGE_DEPENDS
-    "libassimp5 (>= 5.2.5), libpugixml1v5 (>= 1.13), libstdc++6 (>= 12), libc6 (>= 2.36)")
+string(CONCAT CPACK_DEBIAN_PACKAGE_DEPENDS
+    "libassimp5 (>= 5.2.5), libpugixml1v5 (>= 1.13), libzip4 (>= 1.7), zlib1g, liblz4-1, "
+    "liblzma5, libzstd1, libpng16-16, libstdc++6 (>= 12), libc6 (>= 2.36)")
 set(CPACK_DEBIAN_COMPRESSION_TYPE gzip)
 include(CPack)

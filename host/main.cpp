@@ -5,6 +5,7 @@
 // Exit codes: 0 imported, 1 the model (or the module, or the output) failed,
 // 2 usage error, 3 a mesh failed validation.
 #include "animation_view.h"
+#include "archive_input.h"
 #include "b_cmdline.h"
 #include "b_exception.h"
 #include "b_format.h"
@@ -245,7 +246,7 @@ int run(int argc, char** argv, HostLog& hostLog) {
     }
     if (positional.size() != 1)
         return usageError(positional.empty() ? "no model given" : "more than one model given");
-    const base::string& model = positional.front();
+    base::string model = positional.front();
 
     if (switches.verbose->isSet())
         hostLog.setShownLevel(switches.verbose->values().empty()
@@ -277,7 +278,7 @@ int run(int argc, char** argv, HostLog& hostLog) {
         !scene::apply_command_line(options, probe, scene::sceneImporter_schema::type(), error))
         return usageError(error);
 
-    if (!checkModel(model, error))
+    if (!host::insideArchive(model) && !checkModel(model, error))
         return failure(error);
 
     // The module must outlive the factory: the factory's descriptors live in it.
@@ -301,6 +302,8 @@ int run(int argc, char** argv, HostLog& hostLog) {
         return failure(
             base::format("the module '{}' offers no {} importer", modulePath, importerType));
 
+    if (!host::chooseArchiveModel(*factory, base::name_id(importerType), model, error))
+        return failure(error);
     sceneImporter->describeOptions(*importer);
     if (!scene::apply_command_line(options, *importer, scene::sceneImporter_schema::type(), error))
         return usageError(error);

@@ -7,6 +7,7 @@
 #include "b_log.h"
 #include "b_plugin_attribute.h"
 #include "scene_schema.h"
+#include "stream/b_fs_archive.h"
 
 #include <assimp/DefaultLogger.hpp>
 #include <assimp/Importer.hpp>
@@ -131,7 +132,9 @@ const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& opti
     const ImportFlags flags = importFlags(options);
     if (flags.removesComponents())
         importer.SetPropertyInteger(AI_CONFIG_PP_RVC_FLAGS, int(flags.components));
-    return importer.ReadFile(path.c_str(), flags.flags);
+    // A compressed file is read by the name of its content ("a.ply.gz" as
+    // "a.ply"), so assimp picks its reader by the real extension.
+    return importer.ReadFile(base::fs::innerName(path).c_str(), flags.flags);
 }
 
 std::uint8_t upAxisForPath(const base::string& path) {
@@ -306,7 +309,8 @@ void AssimpImporter::convert(const aiScene* source, const base::string& path) {
     if (sceneObject) {
         sceneObject->setAttribute(scene::scene_schema::name(), m_factory->uniqueName("scene"));
         sceneObject->setAttribute(scene::scene_schema::root(), base::ref<IPlugin>(root.get()));
-        sceneObject->setAttribute(scene::scene_schema::upAxis(), upAxisForPath(path));
+        sceneObject->setAttribute(scene::scene_schema::upAxis(),
+                                  upAxisForPath(base::fs::innerName(path)));
         sceneObject->setAttribute(scene::scene_schema::time(), base::TimeCode());
     }
     m_scene = sceneObject.get();

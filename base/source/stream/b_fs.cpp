@@ -1,5 +1,7 @@
 #include "stream/b_fs.h"
 
+#include "stream/b_fs_archive.h"
+
 #include "b_exception.h"
 #include "b_stack_walker.h"
 
@@ -408,6 +410,7 @@ MasterFS& master() {
         m->addRef();
         m->registerFS(ref<PluginDesc>(&nativeFileSystem()));
         m->attachFS("native", attachSymLinks);
+        attachArchiveFileSystems(*m);
         return m;
     }();
     return *fs;
