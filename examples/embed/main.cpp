@@ -12,15 +12,16 @@
 
 namespace {
 
-void printNode(base::IPlugin& node, const base::mat43& parentWorld,
-               const base::string& parentPath) {
+// One line per node, indented by its depth: "node NAME X Y Z"; one per mesh
+// below it: "mesh NAME N vertices".
+void printNode(base::IPlugin& node, const base::mat43& parentWorld, int depth) {
     auto* hierarchical = static_cast<scene::IHierarchical*>(
         node.queryInterface(scene::IHierarchical::interfaceName()));
     const base::mat43 world =
         hierarchical ? parentWorld * hierarchical->localTransformation() : parentWorld;
-    const base::string path = parentPath + "/" + base::string(node.name());
     const base::vec3d position = world.t;
-    std::printf("node %s %.6g %.6g %.6g\n", path.c_str(), position.x, position.y, position.z);
+    std::printf("%*snode %s %.9g %.9g %.9g\n", 2 * depth, "", node.name(true).c_str(), position.x,
+                position.y, position.z);
 
     const auto* children = node.findVecAttribute<base::ref<base::IPlugin>>(scene::names::children);
     if (!children)
@@ -29,11 +30,11 @@ void printNode(base::IPlugin& node, const base::mat43& parentWorld,
         if (!child)
             continue;
         if (child->className() == scene::names::node) {
-            printNode(*child, world, path);
+            printNode(*child, world, depth + 1);
         } else if (const auto* positions =
                        child->findVecAttribute<base::vec3f>(scene::names::positions)) {
-            std::printf("mesh %s/%s %zu vertices\n", path.c_str(),
-                        base::string(child->name()).c_str(), positions->size());
+            std::printf("%*smesh %s %zu vertices\n", 2 * depth + 2, "", child->name(true).c_str(),
+                        positions->size());
         }
     }
 }
@@ -79,7 +80,7 @@ int main(int argc, char** argv) {
             continue;
         if (const auto* root = object->findAttribute<base::ref<base::IPlugin>>(scene::names::root);
             root && *root)
-            printNode(**root, base::mat43::identity(), {});
+            printNode(**root, base::mat43::identity(), 0);
     }
     return 0;
 }
