@@ -5,6 +5,8 @@
 #   (a) read    assimp's ReadFile alone with the importer's default flags
 #   (b) import  module load + importer + import into a factory
 #   (c) json    (b) plus the factory written as JSON
+#   (d) unchecked  (b) without assimp's structure validation, whose cost is
+#               the difference between (b) and (d)
 # Prints the median wall time, CPU time (user+sys) and peak RSS of each case
 # and their ratios to (a). The CPU ratio is the steadier one when other work
 # shares the cores.
@@ -52,17 +54,17 @@ for count in $triangles; do
         # Cases interleaved per repetition, so a burst of outside load hits
         # all of them alike.
         for ((r = 0; r < reps; ++r)); do
-            for c in read import json; do
+            for c in read import json unchecked; do
                 "$run" "$c" "$model" --json "$json" >>"$log"
             done
         done
         declare -A wall cpu mem
-        for c in read import json; do
+        for c in read import json unchecked; do
             wall[$c]=$(grep "^$c " "$log" | field seconds | median)
             cpu[$c]=$(grep "^$c " "$log" | field cpu | median)
             mem[$c]=$(grep "^$c " "$log" | field peak_kib | median)
         done
-        for c in read import json; do
+        for c in read import json unchecked; do
             awk -v m="$(basename "$model")" -v c="$c" -v w="${wall[$c]}" -v u="${cpu[$c]}" \
                 -v k="${mem[$c]}" -v w0="${wall[read]}" -v u0="${cpu[read]}" -v k0="${mem[read]}" \
                 'BEGIN { printf "%-22s %-7s %9.3f %9.3f %10.1f %7.3f %7.3f %7.3f\n",

@@ -104,7 +104,25 @@ ImportFlags importFlags(const base::AttribMap& options) {
         remove(aiComponent_CAMERAS);
     if (optionIs(options, S::importAnimations(), false))
         remove(aiComponent_ANIMATIONS);
+    // On unless switched off: assimp's checker turns many inconsistent scenes,
+    // which its later steps would crash on, into a clean rejection.
+    if (!optionIs(options, S::importValidate(), false))
+        out.flags |= aiProcess_ValidateDataStructure;
     return out;
+}
+
+bool structureCheckIsTolerable(std::string_view reason) noexcept {
+    constexpr std::string_view tolerable[] = {
+        "aiScene::mNumMeshes is 0",
+        "contains no faces",
+        "contains no vertices",
+        "has no corresponding node in the scene graph",
+        "A node of the scene-graph is nullptr",
+    };
+    for (std::string_view text : tolerable)
+        if (reason.find(text) != std::string_view::npos)
+            return true;
+    return false;
 }
 
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
@@ -112,7 +130,15 @@ const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& opti
     const ImportFlags flags = importFlags(options);
     if (flags.removesComponents())
         importer.SetPropertyInteger(AI_CONFIG_PP_RVC_FLAGS, int(flags.components));
-    return importer.ReadFile(path.c_str(), flags.flags);
+    const aiScene* scene = importer.ReadFile(path.c_str(), flags.flags);
+    if (!scene && (flags.flags & aiProcess_ValidateDataStructure) &&
+        structureCheckIsTolerable(importer.GetErrorString())) {
+        base::logFormatted(base::logScene, base::logInfo,
+                           "assimp import |{}| Reading again without the structure check: {}", path,
+                           importer.GetErrorString());
+        scene = importer.ReadFile(path.c_str(), flags.flags & ~aiProcess_ValidateDataStructure);
+    }
+    return scene;
 }
 
 std::uint8_t upAxisForPath(const base::string& path) {
@@ -176,6 +202,7 @@ void AssimpImporter::describeOptions(base::AttribMap& options) {
         options.setAttribute(S::importCameras(), S::importCamerasDefault());
         options.setAttribute(S::importHair(), S::importHairDefault());
         options.setAttribute(S::importAnimations(), S::importAnimationsDefault());
+        options.setAttribute(S::importValidate(), S::importValidateDefault());
         options.setClassName(S::type());
     } catch (const base::exception& e) {
         e.log(base::log());

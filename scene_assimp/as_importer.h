@@ -17,6 +17,7 @@
 #include "scene_interfaces.h"
 
 #include <cstdint>
+#include <string_view>
 
 struct aiScene;
 struct aiNode;
@@ -40,8 +41,16 @@ struct ImportFlags {
 // option that is absent or of another type changes nothing.
 ImportFlags importFlags(const base::AttribMap& options);
 
+// Whether a rejection by assimp's structure check names a shape that the
+// conversion handles and that the readers produce for valid files: a scene
+// without meshes, a mesh without faces (a point cloud) or without vertices,
+// a light or camera without a node, a hole in the node tree.
+bool structureCheckIsTolerable(std::string_view reason) noexcept;
+
 // Sets up 'importer' for the options held by 'options' (flag word and
-// removed components) and reads the file: what the import runs.
+// removed components) and reads the file: what the import runs. A file the
+// structure check rejects for a tolerable reason is read again without it,
+// so no valid scene is lost to the check.
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
                          const base::string& path);
 

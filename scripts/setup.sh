@@ -4,7 +4,7 @@
 set -euo pipefail
 
 packages=(cmake g++ make libassimp-dev assimp-utils assimp-testmodels rapidjson-dev
-          libpugixml-dev googletest libgtest-dev libbenchmark-dev)
+          libpugixml-dev googletest libgtest-dev libbenchmark-dev python3)
 
 missing=()
 for p in "${packages[@]}"; do

@@ -6,8 +6,10 @@
 //   import  the whole import: scene types, module load, importer creation,
 //           option defaults, import into a factory
 //   json    the whole import, then the factory written as JSON to a file
+//   unchecked  the whole import with assimp's structure validation switched
+//           off ("importValidate" false), to price the validation step
 //
-//   import_case <read|import|json> <model> [--module PATH] [--json OUT] [--trace MS]
+//   import_case <read|import|json|unchecked> <model> [--module PATH] [--json OUT] [--trace MS]
 //
 // Output, one line: "<case> seconds=<wall> cpu=<user+sys> peak_kib=<VmHWM> ..."
 // then counts that show what was read (assimp's vertices and faces, or the
@@ -47,9 +49,10 @@ namespace {
 using Clock = std::chrono::steady_clock;
 
 // The flag word the importer reads with when no option changes it.
-constexpr unsigned importerDefaultFlags =
-    aiProcess_JoinIdenticalVertices | aiProcess_GenSmoothNormals | aiProcess_FindInstances;
-static_assert(importerDefaultFlags == 0x100042);
+constexpr unsigned importerDefaultFlags = aiProcess_JoinIdenticalVertices |
+                                          aiProcess_GenSmoothNormals | aiProcess_FindInstances |
+                                          aiProcess_ValidateDataStructure;
+static_assert(importerDefaultFlags == 0x100442);
 
 long statusKib(const char* field) {
     std::ifstream status("/proc/self/status");
@@ -145,7 +148,7 @@ void runRead(const std::string& model, int tracePeriod) {
 
 // Cases "import" and "json".
 void runImport(const std::string& model, const std::string& modulePath, const std::string& json,
-               int tracePeriod) {
+               int tracePeriod, bool validate = true) {
     using LoadEntry = int (*)(base::PluginFactory&);
     using UnloadEntry = int (*)();
 
@@ -179,6 +182,8 @@ void runImport(const std::string& model, const std::string& modulePath, const st
         if (!sceneImporter)
             fail("the module offers no AssimpImporter");
         sceneImporter->describeOptions(*importer);
+        if (!validate)
+            importer->setAttribute(base::name_id("importValidate"), false);
 
         trace.mark("import");
         const Clock::time_point importStart = Clock::now();
@@ -209,7 +214,10 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     dlclose(module);
     std::printf(
         "%s seconds=%.4f cpu=%.4f peak_kib=%ld objects=%zu meshes=%zu import_seconds=%.4f\n",
-        json.empty() ? "import" : "json", seconds, cpu, peak, objects, meshes, importSeconds);
+        !json.empty() ? "json"
+        : validate    ? "import"
+                      : "unchecked",
+        seconds, cpu, peak, objects, meshes, importSeconds);
 }
 
 } // namespace
@@ -217,7 +225,7 @@ void runImport(const std::string& model, const std::string& modulePath, const st
 int main(int argc, char** argv) {
     if (argc < 3) {
         std::fprintf(stderr,
-                     "usage: %s <read|import|json> <model> [--module PATH] [--json OUT] "
+                     "usage: %s <read|import|json|unchecked> <model> [--module PATH] [--json OUT] "
                      "[--trace MS]\n",
                      argv[0]);
         return 2;
@@ -244,6 +252,8 @@ int main(int argc, char** argv) {
             runRead(model, tracePeriod);
         else if (which == "import")
             runImport(model, modulePath, {}, tracePeriod);
+        else if (which == "unchecked")
+            runImport(model, modulePath, {}, tracePeriod, false);
         else if (which == "json")
             runImport(model, modulePath, json.empty() ? model + ".json" : json, tracePeriod);
         else

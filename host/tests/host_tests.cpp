@@ -46,13 +46,17 @@ protected:
         fs::create_directories(m_dir / "folder.obj");
         std::ofstream(m_dir / "empty.obj").close();
         std::ofstream(m_dir / "noise.xyz") << "this is not a model of any kind\n";
+        fs::create_symlink(m_dir / "noise.xyz", m_dir / "symlink.xyz");
+        fs::create_hard_link(m_dir / "noise.xyz", m_dir / "hardlink.xyz");
     }
     void TearDown() override { fs::remove_all(m_dir); }
 
     // Runs scene-import with 'args' through the shell, its standard error captured
     // in a file.
-    HostRun run(std::vector<std::string> args) {
-        std::string command = "'" SCENE_IMPORT_EXE "'";
+    // 'prefix' and 'suffix' wrap the command line (a limit, a pipe).
+    HostRun run(std::vector<std::string> args, const std::string& prefix = {},
+                const std::string& suffix = {}) {
+        std::string command = prefix + "'" SCENE_IMPORT_EXE "'";
         for (std::string& a : args) {
             if (a.starts_with("{tmp}"))
                 a = (m_dir / a.substr(6)).string();
@@ -62,7 +66,8 @@ protected:
         }
         const fs::path errPath = m_dir / "stderr";
         HostRun run;
-        FILE* pipe = popen((command + " 2>'" + errPath.string() + "' </dev/null").c_str(), "r");
+        FILE* pipe =
+            popen((command + " 2>'" + errPath.string() + "' </dev/null" + suffix).c_str(), "r");
         if (!pipe)
             return run;
         char buffer[4096];
@@ -125,7 +130,45 @@ INSTANTIATE_TEST_SUITE_P(
         ExitCase{"OutputWithoutFile", {"{sample}", "-o"}, 2, "--help"},
         ExitCase{"ModuleMissing", {"--plugin", "{tmp}/none.so", "{sample}"}, 1, "none.so"},
         ExitCase{
-            "UnwritableOutput", {"{sample}", "-o", "{tmp}/no/such/out.json"}, 1, "cannot write"}),
+            "OutputFolderMissing", {"{sample}", "-o", "{tmp}/no/such/out.json"}, 1, "the folder '"},
+        ExitCase{"OutputIsAFolder", {"{sample}", "-o", "{tmp}/folder.obj"}, 1, "it is a folder"},
+        // Refused before anything is read, whatever the spelling.
+        ExitCase{"OutputIsTheModel", {"{tmp}/noise.xyz", "-o", "{tmp}/noise.xyz"}, 2, "itself"},
+        ExitCase{"OutputIsTheModelSpelledOtherwise",
+                 {"{tmp}/noise.xyz", "-o", "{tmp}/folder.obj/.././noise.xyz"},
+                 2,
+                 "itself"},
+        ExitCase{"OutputIsASymlinkToTheModel",
+                 {"{tmp}/noise.xyz", "-o", "{tmp}/symlink.xyz"},
+                 2,
+                 "itself"},
+        ExitCase{"OutputIsAHardLinkToTheModel",
+                 {"{tmp}/hardlink.xyz", "-o", "{tmp}/noise.xyz"},
+                 2,
+                 "itself"},
+        // Values outside what a switch allows name the switch and the values.
+        ExitCase{
+            "UpAxisNotAnAxis", {"-upAxis", "7", "{sample}"}, 2, "'-upAxis'. Expected one of x"},
+        ExitCase{"NormalsNotAChoice",
+                 {"-importNormals", "9", "{sample}"},
+                 2,
+                 "'-importNormals'. Expected one of none"},
+        ExitCase{"TessellationBeyondFloat",
+                 {"-importTessellation", "1e999", "{sample}"},
+                 2,
+                 "'-importTessellation'. Expected a finite number"},
+        ExitCase{"NegativeTimeout",
+                 {"--timeout", "-5", "{sample}"},
+                 2,
+                 "'--timeout'. Expected a whole number from 0"},
+        ExitCase{"NegativeMemory", {"--max-memory", "-1", "{sample}"}, 2, "'--max-memory'"},
+        ExitCase{"VerbosityTooHigh", {"-v", "9", "{sample}"}, 2, "from 0 to 5"},
+        ExitCase{
+            "WordAfterVerbose", {"-v", "abc", "{sample}"}, 2, "unexpected value 'abc' after -v"},
+        ExitCase{"WordAfterValidate",
+                 {"{sample}", "--validate", "abc"},
+                 2,
+                 "unexpected value 'abc' after --validate"}),
     [](const auto& info) { return std::string(info.param.name); });
 
 // ---- Output ----
@@ -252,6 +295,71 @@ TEST_F(HostTest, ValidateReportsTheMeshesOfTheSample) {
     const HostRun r = run({"--validate", "{sample}"});
     EXPECT_EQ(r.code, 0) << r.err;
     EXPECT_NE(r.out.find("validate:"), std::string::npos) << r.out;
+}
+
+// A failed import states its reason once, in the host's words.
+TEST_F(HostTest, FailureReasonOnceWithoutTags) {
+    for (const bool isolated : {true, false}) {
+        std::vector<std::string> args{"{tmp}/noise.xyz"};
+        if (!isolated)
+            args.insert(args.begin(), "--no-isolation");
+        const HostRun r = run(args);
+        EXPECT_EQ(r.code, 1);
+        EXPECT_NE(r.err.find("scene-import: cannot import '"), std::string::npos) << r.err;
+        EXPECT_EQ(r.err.find("assimp|"), std::string::npos) << r.err;
+        EXPECT_EQ(r.err.find("::"), std::string::npos) << r.err;
+        const std::size_t reason = r.err.rfind(": ");
+        ASSERT_NE(reason, std::string::npos);
+        const std::string text = r.err.substr(reason + 2, 30);
+        EXPECT_EQ(r.err.find(text), reason + 2) << "the reason is repeated:\n" << r.err;
+    }
+}
+
+// A document is written whole or not at all: a write that fails part-way
+// (here at a file-size limit) leaves the previous file and no temporary one.
+TEST_F(HostTest, FailedWriteKeepsThePreviousDocument) {
+    const fs::path out = m_dir / "out.json";
+    std::ofstream(out) << "previous";
+    for (const char* isolation : {"", "--no-isolation"}) {
+        std::vector<std::string> args{"{sample}", "-o", "{tmp}/out.json"};
+        if (*isolation)
+            args.push_back(isolation);
+        const HostRun r = run(args, "prlimit --fsize=4096 ");
+        EXPECT_EQ(r.code, 1) << r.err;
+        EXPECT_NE(r.err.find("File too large"), std::string::npos) << r.err;
+        EXPECT_EQ(readFile(out), "previous");
+        for (const auto& entry : fs::directory_iterator(m_dir))
+            EXPECT_FALSE(entry.path().string().ends_with(".tmp")) << entry.path();
+    }
+    const HostRun r = run({"{sample}", "-o", "{tmp}/out.json"});
+    EXPECT_EQ(r.code, 0) << r.err;
+    EXPECT_EQ(readFile(out).front(), '{');
+}
+
+// Writing into a pipe that closes early is a write error, not death by SIGPIPE.
+TEST_F(HostTest, ClosedPipeIsAWriteError) {
+    // A grid big enough that its document outgrows any pipe buffer.
+    {
+        std::ofstream grid(m_dir / "grid.obj");
+        constexpr int n = 150;
+        for (int y = 0; y <= n; ++y)
+            for (int x = 0; x <= n; ++x)
+                grid << "v " << x << ' ' << y << " 0\n";
+        for (int y = 0; y < n; ++y)
+            for (int x = 0; x < n; ++x) {
+                const int a = y * (n + 1) + x + 1;
+                grid << "f " << a << ' ' << a + 1 << ' ' << a + n + 2 << ' ' << a + n + 1 << '\n';
+            }
+    }
+    // The host's own status, not head's.
+    std::ofstream(m_dir / "pipe.sh")
+        << "'" SCENE_IMPORT_EXE "' '" << (m_dir / "grid.obj").string() << "' -o - 2>'"
+        << (m_dir / "err").string() << "' | head -c 100 >/dev/null; exit ${PIPESTATUS[0]}\n";
+    const int status = std::system(("bash '" + (m_dir / "pipe.sh").string() + "'").c_str());
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 1);
+    EXPECT_NE(readFile(m_dir / "err").find("Broken pipe"), std::string::npos)
+        << readFile(m_dir / "err");
 }
 
 // ---- Scene counts ----
