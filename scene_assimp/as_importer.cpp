@@ -15,6 +15,7 @@
 #include <assimp/scene.h>
 
 #include <cctype>
+#include <optional>
 #include <string_view>
 
 namespace as {
@@ -46,6 +47,27 @@ struct InstalledLogger {
     InstalledLogger(const InstalledLogger&) = delete;
     InstalledLogger& operator=(const InstalledLogger&) = delete;
 };
+
+// Whether the text after the last '.' of the path's last component (split
+// on '/' and '\\') is 'extension', in any letter case.
+bool extensionIs(std::string_view path, std::string_view extension) noexcept {
+    if (const auto slash = path.find_last_of("/\\"); slash != std::string_view::npos)
+        path.remove_prefix(slash + 1);
+    const auto dot = path.rfind('.');
+    if (dot == std::string_view::npos || path.size() - dot - 1 != extension.size())
+        return false;
+    for (std::size_t i = 0; i < extension.size(); ++i)
+        if (std::tolower(static_cast<unsigned char>(path[dot + 1 + i])) != extension[i])
+            return false;
+    return true;
+}
+
+// Whether a second read of the file in this process is safe. assimp's
+// OpenGEX reader shares objects between its reads: after a failed structure
+// check a second read frees them twice.
+bool rereadable(const base::string& path) noexcept {
+    return !extensionIs(path, "ogex");
+}
 
 void logFatal(const base::string& path) noexcept {
     try {
@@ -126,36 +148,16 @@ bool structureCheckIsTolerable(std::string_view reason) noexcept {
 }
 
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
-                         const base::string& path) {
+                         const base::string& path, bool check) {
     const ImportFlags flags = importFlags(options);
     if (flags.removesComponents())
         importer.SetPropertyInteger(AI_CONFIG_PP_RVC_FLAGS, int(flags.components));
-    const aiScene* scene = importer.ReadFile(path.c_str(), flags.flags);
-    if (!scene && (flags.flags & aiProcess_ValidateDataStructure) &&
-        structureCheckIsTolerable(importer.GetErrorString())) {
-        base::logFormatted(base::logScene, base::logInfo,
-                           "assimp import |{}| Reading again without the structure check: {}", path,
-                           importer.GetErrorString());
-        scene = importer.ReadFile(path.c_str(), flags.flags & ~aiProcess_ValidateDataStructure);
-    }
-    return scene;
+    return importer.ReadFile(path.c_str(),
+                             check ? flags.flags : flags.flags & ~aiProcess_ValidateDataStructure);
 }
 
 std::uint8_t upAxisForPath(const base::string& path) {
-    std::string_view file(path);
-    if (const auto slash = file.find_last_of("/\\"); slash != std::string_view::npos)
-        file.remove_prefix(slash + 1);
-    const auto dot = file.rfind('.');
-    if (dot == std::string_view::npos)
-        return 1;
-    const std::string_view extension = file.substr(dot + 1);
-    constexpr std::string_view blend = "blend";
-    if (extension.size() != blend.size())
-        return 1;
-    for (std::size_t i = 0; i < blend.size(); ++i)
-        if (std::tolower(static_cast<unsigned char>(extension[i])) != blend[i])
-            return 1;
-    return 2;
+    return extensionIs(path, "blend") ? 2 : 1;
 }
 
 base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginFactory& factory) {
@@ -217,12 +219,26 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
     // fatal line.
     try {
         Assimp::Importer importer;
+        std::optional<Assimp::Importer> unchecked;
         importer.SetIOHandler(new AssimpIO());
         InstalledLogger logger;
 
         const aiScene* source = nullptr;
         try {
             source = readScene(importer, *this, path);
+            // A file the structure check rejects for a shape valid files
+            // have is read again without it, so no valid scene is lost. A
+            // fresh importer: one whose check failed keeps freed state.
+            if (!source && (importFlags(*this).flags & aiProcess_ValidateDataStructure) &&
+                structureCheckIsTolerable(importer.GetErrorString()) && rereadable(path)) {
+                base::logFormatted(
+                    base::logScene, base::logInfo,
+                    "assimp import |{}| Reading again without the structure check: {}", path,
+                    importer.GetErrorString());
+                unchecked.emplace();
+                unchecked->SetIOHandler(new AssimpIO());
+                source = readScene(*unchecked, *this, path, false);
+            }
         } catch (...) {
             // Nothing was read (assimp gave up, for instance out of memory):
             // a failure, not an empty success.
@@ -239,7 +255,7 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
             logFatal(path);
         }
         releaseImportState();
-        importer.FreeScene();
+        (unchecked ? *unchecked : importer).FreeScene();
         return true;
     } catch (...) {
         releaseImportState();

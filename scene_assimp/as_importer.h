@@ -48,11 +48,10 @@ ImportFlags importFlags(const base::AttribMap& options);
 bool structureCheckIsTolerable(std::string_view reason) noexcept;
 
 // Sets up 'importer' for the options held by 'options' (flag word and
-// removed components) and reads the file: what the import runs. A file the
-// structure check rejects for a tolerable reason is read again without it,
-// so no valid scene is lost to the check.
+// removed components) and reads the file: what the import runs. 'check'
+// false leaves assimp's structure check out whatever the options say.
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
-                         const base::string& path);
+                         const base::string& path, bool check = true);
 
 // The "node" objects of 'factory' by name, in registration order: a name
 // already taken keeps its first node.
