@@ -15,6 +15,7 @@
 #include "isolation.h"
 #include "module_loader.h"
 #include "output_file.h"
+#include "read_back.h"
 #include "scene_cmdline.h"
 #include "scene_features.h"
 #include "scene_import.h"
@@ -50,7 +51,12 @@ int failure(std::string_view message) {
 }
 
 // Switches of the features beyond the host's own.
-void registerFeatureSwitches(base::CmdLineOptions&) {}
+void registerFeatureSwitches(base::CmdLineOptions& options) {
+    options.addValue<base::string>(
+        "--read", {},
+        "Read a scene document written by this program (instead of importing a model) and, "
+        "with -o, write it again.");
+}
 
 // The features the switches ask for, in the order they run.
 base::vector<host::SceneFeature> sceneFeatures(const host::HostSwitches& switches,
@@ -124,14 +130,24 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         std::fwrite(help.data(), 1, help.size(), stdout);
         return exitImported;
     }
-    if (positional.size() != 1)
-        return usageError(positional.empty() ? "no model given" : "more than one model given");
-
     if (switches.verbose->isSet())
         hostLog.setShownLevel(switches.verbose->values().empty() ? int(base::logInfo)
                                                                  : switches.verbose->value());
     else if (host::isOn(switches.quiet))
         hostLog.setShownLevel(base::logError);
+
+    if (const auto* read = options.findValue<base::string>("--read"); read && read->isSet()) {
+        if (!positional.empty())
+            return usageError("--read takes no model");
+        const base::string output =
+            switches.output->isSet() ? switches.output->values().front() : base::string();
+        if (!output.empty() && output != "-" && host::sameFile(read->value(), output))
+            return usageError(base::format("the output '{}' is the document itself", output));
+        const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
+        return host::readBack(read->value(), output, summary, hostLog);
+    }
+    if (positional.size() != 1)
+        return usageError(positional.empty() ? "no model given" : "more than one model given");
 
     host::ImportSettings settings;
     settings.model = positional.front();

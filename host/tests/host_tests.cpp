@@ -362,6 +362,56 @@ TEST_F(HostTest, ClosedPipeIsAWriteError) {
         << readFile(m_dir / "err");
 }
 
+// ---- Read-back ----
+
+// Import, write, read, write: the same bytes.
+TEST_F(HostTest, ReadBackWritesTheSameDocument) {
+    ASSERT_EQ(run({"{sample}", "-o", "{tmp}/first.json"}).code, 0);
+    const HostRun r = run({"--read", "{tmp}/first.json", "-o", "{tmp}/second.json"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    const std::string first = readFile(m_dir / "first.json");
+    EXPECT_GT(first.size(), 1000u);
+    EXPECT_TRUE(first == readFile(m_dir / "second.json"));
+    const HostRun summary = run({"--read", "{tmp}/first.json"});
+    EXPECT_EQ(summary.code, 0) << summary.err;
+    EXPECT_EQ(summaryLines(summary.out)["node"], 11);
+}
+
+// Broken documents: a clear error with its line, exit 1, what can be read is
+// read and written.
+TEST_F(HostTest, ReadBackOfBrokenDocuments) {
+    struct Row {
+        const char* name;
+        const char* text;
+        const char* stderrHas;
+        bool written;
+    };
+    const Row rows[] = {
+        {"truncated", "{\n\"node\": {\n\t\"name^string\": \"a\",\n", "json parser", true},
+        {"unknown type", "{\n\"node\": {\"name^string\": \"a\"},\n\"frob\": {}\n}\n", "frob", true},
+        {"missing reference", "{\n\"scene\": {\n\t\"root^plugin\": \"nowhere\"\n}\n}\n", "nowhere",
+         true},
+        {"wrong value type", "{\n\"node\": {\n\t\"visible^bool\": \"yes\"\n}\n}\n", "at line 3",
+         true},
+        {"beyond double", "{\n\"node\": {\n\t\"x^double\": 1e400\n}\n}\n", "json parser", true},
+        {"not json", "garbage", "json parser", true},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.name);
+        std::ofstream(m_dir / "doc.json") << row.text;
+        fs::remove(m_dir / "out.json");
+        const HostRun r = run({"--read", "{tmp}/doc.json", "-o", "{tmp}/out.json"});
+        EXPECT_EQ(r.code, 1) << r.err;
+        EXPECT_NE(r.err.find(row.stderrHas), std::string::npos) << r.err;
+        EXPECT_EQ(fs::exists(m_dir / "out.json"), row.written);
+    }
+    // A float below its range reads as the nearest value instead of being dropped.
+    std::ofstream(m_dir / "doc.json") << "{\n\"node\": {\n\t\"tiny^float\": 1e-50\n}\n}\n";
+    const HostRun r = run({"--read", "{tmp}/doc.json", "-o", "-"});
+    EXPECT_EQ(r.code, 0) << r.err;
+    EXPECT_NE(r.out.find("\"tiny^float\": 0"), std::string::npos) << r.out;
+}
+
 // ---- Scene counts ----
 
 TEST(SceneStats, CountsFollowLinksAndBothFaceForms) {
