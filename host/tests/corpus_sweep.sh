@@ -4,7 +4,8 @@
 #   - the host never crashes, hangs or leaks (sanitizer reports fail it),
 #   - it exits 0 exactly when assimp itself reads the file with the same flags,
 #   - its JSON document parses and, once it holds meshes, the meshes that
-#     assimp's nodes reference appear with assimp's vertex and face counts.
+#     assimp's nodes reference appear with assimp's vertex and face counts,
+#   - the document read back with --read and written again is the same bytes.
 #
 # usage: corpus_sweep.sh SCENE_IMPORT ASSIMP_REFERENCE CORPUS_DIR
 # Environment: SWEEP_JOBS (2), SWEEP_TIMEOUT seconds per file (300),
@@ -50,13 +51,19 @@ sweep_one() {
     err=$out/stderr
     timeout -k 10 "$limit" "$host" -q "$file" -o "$json" >/dev/null 2>"$err"
     local hc=$?
-    local rc detail=""
+    local rc detail="" again=ok
     if [ $hc -eq 0 ]; then
         detail=$(timeout -k 10 "$limit" "$reference" "$file" "$json" 2>&1)
+        rc=$?
+        timeout -k 10 "$limit" "$host" -q --read "$json" -o "$out/again.json" >/dev/null 2>>"$err"
+        local ac=$?
+        if [ $ac -ne 0 ]; then again="read back: exit $ac"
+        elif ! cmp -s "$json" "$out/again.json"; then again="read back: $(cmp "$json" "$out/again.json" | head -1)"
+        else again="ok $(stat -c %s "$json")"; fi
     else
         timeout -k 10 "$limit" "$reference" "$file" >/dev/null 2>&1
+        rc=$?
     fi
-    rc=$?
     local verdict
     if [ $hc -eq 124 ] || [ $hc -eq 137 ]; then
         verdict=hang
@@ -77,8 +84,12 @@ sweep_one() {
         verdict=mesh-unstable
     elif [ $hc -eq 0 ] && [ $rc -eq 4 ]; then
         verdict=mesh-mismatch
+    elif [ $hc -eq 0 ] && [[ $again != ok* ]]; then
+        verdict=round-trip
+        detail=$again
     elif [ $hc -eq 0 ]; then
         verdict=imported
+        detail="$detail; round trip $again"
     else
         verdict=rejected
     fi
@@ -132,7 +143,10 @@ seconds=$(($(date +%s) - start))
 
 count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
-imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json)))
+imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-unstable) + $(count bad-json) + $(count round-trip)))
+roundtrip=$(count round-trip)
+same=$(grep -c 'round trip ok' "$work/results")
+bytes=$(grep -o 'round trip ok [0-9]*' "$work/results" | awk '{ s += $4 } END { print s + 0 }')
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
@@ -147,6 +161,7 @@ awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
     done
 echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
-     "mesh counts checked $checked, mesh-count mismatches $meshdiff, seconds $seconds"
+     "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
+     "read back identical $same ($bytes bytes), read-back differences $roundtrip, seconds $seconds"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff)) -eq 0 ]
+[ $((mismatches + crashes + hangs + badjson + meshdiff + roundtrip)) -eq 0 ]
