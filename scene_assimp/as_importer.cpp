@@ -62,13 +62,6 @@ bool extensionIs(std::string_view path, std::string_view extension) noexcept {
     return true;
 }
 
-// Whether a second read of the file in this process is safe. assimp's
-// OpenGEX reader shares objects between its reads: after a failed structure
-// check a second read frees them twice.
-bool rereadable(const base::string& path) noexcept {
-    return !extensionIs(path, "ogex");
-}
-
 void logFatal(const base::string& path) noexcept {
     try {
         base::logFormatted(base::logScene, base::logCritical,
@@ -230,7 +223,7 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
             // have is read again without it, so no valid scene is lost. A
             // fresh importer: one whose check failed keeps freed state.
             if (!source && (importFlags(*this).flags & aiProcess_ValidateDataStructure) &&
-                structureCheckIsTolerable(importer.GetErrorString()) && rereadable(path)) {
+                structureCheckIsTolerable(importer.GetErrorString())) {
                 base::logFormatted(
                     base::logScene, base::logInfo,
                     "assimp import |{}| Reading again without the structure check: {}", path,

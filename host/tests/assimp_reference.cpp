@@ -249,9 +249,8 @@ int main(int argc, char** argv) {
         // The importer reads again without the structure check when it
         // rejects a shape that valid files have; so does the reference.
         Assimp::Importer unchecked;
-        const std::string_view model(argv[1]);
         if (!scene && (flags & aiProcess_ValidateDataStructure) &&
-            tolerable(importer.GetErrorString()) && !model.ends_with(".ogex"))
+            tolerable(importer.GetErrorString()))
             scene = unchecked.ReadFile(argv[1], flags & ~aiProcess_ValidateDataStructure);
         if (!scene || !scene->mRootNode)
             return 1;
