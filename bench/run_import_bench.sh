@@ -7,6 +7,8 @@
 #   plain    assimp's ReadFile alone with the importer's flags (no join)
 #   import   module load + importer + import into a factory
 #   json     import plus the factory written as JSON
+#   unchecked  import without assimp's structure validation ("importValidate"
+#            false); its cost is the difference between import and unchecked
 #   assjson  assimp's command-line tool: `assimp export MODEL OUT -fassjson`
 # Prints the median wall time, CPU time (user+sys) and peak RSS of each case,
 # the ratios of CPU time and memory to "read" and of json to assjson, and the
@@ -22,7 +24,7 @@ set -euo pipefail
 reps=${REPS:-3}
 formats=${FORMATS:-"ply glb"}
 triangles=${TRIANGLES:-"1000000 4000000"}
-cases="read plain import json"
+cases="read plain import json unchecked"
 if [[ "${NO_ASSJSON:-0}" != 1 ]] && command -v assimp >/dev/null; then
     cases="$cases assjson"
 fi
@@ -47,6 +49,7 @@ run_case() {
     read) "$run" read "$model" ;;
     plain) "$run" read-plain "$model" | sed 's/^read-plain /plain /' ;;
     import) "$run" import "$model" ;;
+    unchecked) "$run" unchecked "$model" ;;
     json) "$run" json "$model" --json "$json" ;;
     assjson)
         /usr/bin/time -f 'assjson %e %U %S %M' -o "$models/time.txt" \

@@ -1,134 +1,41 @@
-// scene-import: the stand-alone host. Loads the importer module, imports one
-// model into a fresh factory, optionally validates its meshes, writes the
-// factory as JSON and prints a summary.
+// scene-import: the stand-alone host. Parses the command line and dispatches:
+// one model imported (in an isolated child process unless --no-isolation)
+// and handed to the features the switches ask for. Each feature lives in its
+// own file under host/ and is one function called with the imported scene
+// (scene_import.h); adding one is a switch in registerFeatureSwitches and a
+// line in sceneFeatures.
 //
 // Exit codes: 0 imported, 1 the model (or the module, or the output) failed,
 // 2 usage error, 3 a mesh failed validation.
 #include "animation_view.h"
 #include "archive_input.h"
-#include "b_cmdline.h"
 #include "b_exception.h"
 #include "b_format.h"
-#include "b_json.h"
 #include "b_log.h"
+#include "host_log.h"
+#include "host_options.h"
+#include "isolation.h"
 #include "listing.h"
 #include "module_loader.h"
+#include "output_file.h"
 #include "preview_switches.h"
+#include "read_back.h"
 #include "scene_cmdline.h"
-#include "scene_importer.h"
+#include "scene_features.h"
+#include "scene_import.h"
 #include "scene_interfaces.h"
-#include "scene_stats.h"
-#include "stdout_stream.h"
-#include "stream/b_fs.h"
 #include "texture_extract.h"
 
-#include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
-#include <chrono>
 #include <clocale>
-#include <concepts>
+#include <csignal>
 #include <cstdio>
-#include <cstring>
-#include <filesystem>
-#include <mutex>
 
 namespace {
 
 enum ExitCode : int { exitImported = 0, exitFailed = 1, exitUsage = 2, exitInvalid = 3 };
-
-constexpr std::string_view importerType = "AssimpImporter";
-
-struct HostSwitches {
-    base::CmdLineValue<bool>* help = nullptr;
-    base::CmdLineValue<base::string>* output = nullptr;
-    base::CmdLineValue<base::string>* plugin = nullptr;
-    base::CmdLineValue<bool>* summary = nullptr;
-    base::CmdLineValue<bool>* validate = nullptr;
-    base::CmdLineValue<int>* verbose = nullptr;
-    base::CmdLineValue<bool>* quiet = nullptr;
-    base::CmdLineValue<bool>* flipTextureCoordinates = nullptr;
-    base::CmdLineValue<bool>* flipFaceWinding = nullptr;
-    host::preview::PreviewSwitches preview;
-    base::CmdLineValue<base::string>* list = nullptr;
-};
-
-HostSwitches registerSwitches(base::CmdLineOptions& options) {
-    HostSwitches s;
-    s.help = options.addValue<bool>("--help", "-h", "Print this help and exit.", 0, 1);
-    s.output = options.addValue<base::string>(
-        "-o", "--output",
-        "Write the imported scene as JSON to this file; '-' writes it to standard output.");
-    s.plugin = options.addValue<base::string>(
-        "--plugin", {},
-        "Load the importer module from this file instead of scene_assimp.so "
-        "beside the executable.");
-    s.summary = options.addValue<bool>(
-        "--summary", {},
-        "Print the object count per type, the vertices, faces and joints and the time taken. "
-        "On by default when no -o is given.",
-        0, 1);
-    s.validate = options.addValue<bool>(
-        "--validate", {},
-        "Validate every imported mesh, print the findings and exit with 3 when one fails.", 0, 1);
-    s.verbose = options.addValue<int>("-v", "--verbose",
-                                      "Log more: information, or the level given (0 to 5).", 0, 1);
-    s.quiet = options.addValue<bool>("-q", "--quiet", "Log errors only.", 0, 1);
-    scene::register_importer_options(options);
-    scene::register_scene_options(options);
-    s.flipTextureCoordinates = options.addValue<bool>(
-        "-importFlipTextureCoordinates", {},
-        "Whether to flip the texture coordinates vertically (v becomes 1 - v).");
-    s.flipFaceWinding = options.addValue<bool>(
-        "-importFlipFaceWinding", {}, "Whether to reverse the vertex order of every face.");
-    s.preview = host::preview::registerSwitches(options);
-    s.list = options.addValue<base::string>(
-        "--list", {},
-        "Print one line per object of the kinds given, separated by commas: cameras and lights "
-        "(name, node path, world position and view direction, lens or light values), nodes "
-        "(world position of every node), poses (local translate, rotate and scale).");
-    return s;
-}
-
-// Forwards to the standard-error log up to the level the user asked for, and
-// keeps the last error so a failed import can name its reason in one line.
-class HostLog final : public base::ILog {
-public:
-    void setShownLevel(int level) {
-        m_shown = level;
-        // Errors always reach log() so the reason of a failure is known.
-        setMaxLevel(std::max(level, int(base::logError)));
-    }
-    int shownLevel() const noexcept { return m_shown; }
-
-    void log(base::name_id channel, int level, std::string_view message) override {
-        {
-            std::lock_guard lock(m_mutex);
-            if (level >= base::logCritical && level <= base::logError)
-                m_lastError.assign(message.data(), message.size());
-        }
-        if (level <= m_shown)
-            m_out.log(channel, level, message);
-    }
-
-    base::string lastError() const {
-        std::lock_guard lock(m_mutex);
-        return m_lastError;
-    }
-    void clearLastError() {
-        std::lock_guard lock(m_mutex);
-        m_lastError.clear();
-    }
-
-private:
-    base::StdErrLog m_out;
-    int m_shown = base::logWarning;
-    mutable std::mutex m_mutex;
-    base::string m_lastError;
-};
 
 void printUsage(std::FILE* to) {
     std::fputs("usage: scene-import [switches] MODEL [-o OUT.json]\n"
@@ -148,128 +55,171 @@ int failure(std::string_view message) {
     return exitFailed;
 }
 
-// The reasons a model cannot be imported that the host can tell before
-// assimp runs. Anything but a regular file is refused so that a FIFO or a
-// device cannot stall the import.
-bool checkModel(const base::string& path, base::string& reason) {
-    struct stat info {};
-    if (::stat(path.c_str(), &info) != 0) {
-        reason = base::format("cannot open '{}': {}", path, std::strerror(errno));
-        return false;
-    }
-    if (S_ISDIR(info.st_mode)) {
-        reason = base::format("'{}' is a directory", path);
-        return false;
-    }
-    if (!S_ISREG(info.st_mode)) {
-        reason = base::format("'{}' is not a regular file", path);
-        return false;
-    }
-    const int fd = ::open(path.c_str(), O_RDONLY | O_CLOEXEC);
-    if (fd < 0) {
-        reason = base::format("cannot read '{}': {}", path, std::strerror(errno));
-        return false;
-    }
-    ::close(fd);
-    if (info.st_size == 0) {
-        reason = base::format("'{}' is empty", path);
-        return false;
-    }
-    return true;
-}
-
-// Texture paths come out relative to the factory's name, so the factory is
-// named after the folder the document is saved in.
-base::string factoryName(const base::string& model, const base::string* output) {
-    std::error_code ignored;
-    std::filesystem::path where = std::filesystem::absolute(
-        std::filesystem::path(output ? output->c_str() : model.c_str()), ignored);
-    base::string folder(where.parent_path().string());
-    if (folder.empty() || folder.back() != '/')
-        folder += '/';
-    return folder;
-}
-
-base::IPlugin* newestOfType(const base::PluginFactory& factory, base::name_id type) {
-    for (std::uint32_t id = factory.pluginCount(); id-- > 0;)
-        if (base::ref<base::IPlugin> plugin = factory.plugin(id);
-            plugin && plugin->className() == type)
-            return plugin.get();
-    return nullptr;
-}
-
-template <class Mesh>
-concept Validatable = requires(const Mesh& mesh) {
-    { mesh.validate() } -> std::convertible_to<bool>;
+// Switches of the features beyond the host's own.
+struct FeatureSwitches {
+    base::CmdLineValue<base::string>* read = nullptr;
+    base::CmdLineValue<base::string>* list = nullptr;
+    host::AnimationSwitches animation;
+    host::preview::PreviewSwitches preview;
+    base::CmdLineValue<base::string>* extractTextures = nullptr;
 };
 
-struct ValidationResult {
-    std::uint32_t checked = 0;
-    std::uint32_t failed = 0;
-    bool available = true;
-};
-
-template <class Mesh>
-ValidationResult validateMeshes(const base::PluginFactory& factory) {
-    ValidationResult result;
-    if constexpr (Validatable<Mesh>) {
-        for (std::uint32_t id = 0; id < factory.pluginCount(); ++id) {
-            base::ref<base::IPlugin> plugin = factory.plugin(id);
-            const auto* mesh = dynamic_cast<const Mesh*>(plugin.get());
-            if (!mesh)
-                continue;
-            ++result.checked;
-            if (!mesh->validate())
-                ++result.failed;
-        }
-    } else {
-        result.available = false;
-    }
-    return result;
+FeatureSwitches registerFeatureSwitches(base::CmdLineOptions& options) {
+    FeatureSwitches s;
+    s.read = options.addValue<base::string>(
+        "--read", {},
+        "Read a scene document written by this program (instead of importing a model) and, "
+        "with -o, write it again.");
+    s.list = options.addValue<base::string>(
+        "--list", {},
+        "Print one line per object of the kinds given, separated by commas: cameras and lights "
+        "(name, node path, world position and view direction, lens or light values), nodes "
+        "(world position of every node), poses (local translate, rotate and scale).");
+    s.animation = host::registerAnimationSwitches(options);
+    s.preview = host::preview::registerSwitches(options);
+    s.extractTextures = host::registerExtractTextures(options);
+    return s;
 }
 
-int run(int argc, char** argv, HostLog& hostLog) {
+// What the feature switches ask for, checked before anything is imported.
+struct FeatureRequests {
+    base::vector<host::ListKind> listed;
+    host::preview::PreviewRequest preview;
+    // --list or --frames print on standard output; the summary moves aside.
+    bool reports = false;
+};
+
+// The features the switches ask for, in the order they run: play the
+// animation at --time, validate, write the document, then the reports.
+base::vector<host::SceneFeature> sceneFeatures(const host::HostSwitches& switches,
+                                               const FeatureSwitches& more,
+                                               const FeatureRequests& requests,
+                                               const base::string& output, bool wantSummary) {
+    base::vector<host::SceneFeature> features;
+    if (more.animation.time->isSet())
+        features.emplace_back([time = more.animation.time->value()](host::ImportedScene& scene) {
+            host::playAt(scene.factory, time);
+            return 0;
+        });
+    if (host::isOn(switches.validate))
+        features.emplace_back(host::validateMeshes);
+    if (!output.empty())
+        features.emplace_back(
+            [output](host::ImportedScene& scene) { return host::writeDocument(scene, output); });
+    if (!requests.preview.path.empty())
+        features.emplace_back([preview = requests.preview](host::ImportedScene& scene) {
+            return host::preview::previewFeature(scene.factory, preview);
+        });
+    if (requests.reports)
+        features.emplace_back(
+            [animation = more.animation, listed = requests.listed](host::ImportedScene& scene) {
+                const base::string report = host::animationReport(scene.factory, animation, listed);
+                std::fwrite(report.data(), 1, report.size(), scene.text);
+                return 0;
+            });
+    if (more.extractTextures->isSet())
+        features.emplace_back([option = more.extractTextures](host::ImportedScene& scene) {
+            return host::runExtractTextures(option, scene.factory, scene.text) ? 1 : 0;
+        });
+    if (wantSummary)
+        features.emplace_back([reports = requests.reports](host::ImportedScene& scene) {
+            // Beside a report on standard output, the summary goes to standard error.
+            if (reports)
+                scene.text = stderr;
+            return host::printSummary(scene);
+        });
+    return features;
+}
+
+host::IsolationLimits isolationLimits(const host::HostSwitches& switches) {
+    host::IsolationLimits limits;
+    if (switches.timeout->isSet())
+        limits.timeoutSeconds = std::uint32_t(switches.timeout->value());
+    if (switches.maxMemory->isSet())
+        limits.maxMemoryMiB = std::uint64_t(switches.maxMemory->value());
+    return limits;
+}
+
+// One model, isolated: the child imports and runs the features; the host
+// reports a child that crashed or ran out of time, and removes what it left.
+int importIsolated(const host::ImportSettings& settings, const base::CmdLineOptions& options,
+                   host::HostLog& log, std::span<const host::SceneFeature> features,
+                   const host::IsolationLimits& limits) {
+    const host::ChildEnd end = host::runIsolated(limits, [&](int recordFd) {
+        host::ImportRecord record;
+        const int code = host::importScene(settings, options, log, features, record);
+        const base::string text = host::encodeRecord(record);
+        [[maybe_unused]] const ssize_t ignored = ::write(recordFd, text.data(), text.size());
+        return code;
+    });
+    if (end.kind == host::ChildEnd::exited && end.code <= exitInvalid)
+        return end.code;
+    if (end.kind == host::ChildEnd::notStarted)
+        return failure(end.failure);
+    // The child's partial document, if it got that far.
+    if (!settings.output.empty() && settings.output != "-")
+        ::unlink(host::temporaryPath(settings.output, end.pid).c_str());
+    switch (end.kind) {
+    case host::ChildEnd::signalled:
+        return failure(base::format("assimp crashed reading '{}' ({})", settings.model,
+                                    host::signalText(end.code)));
+    case host::ChildEnd::timedOut:
+        return failure(
+            base::format("assimp hung reading '{}': gave up after {} s", settings.model, end.code));
+    default:
+        // A code the host never answers (a sanitizer's report): passed on.
+        std::fprintf(stderr, "scene-import: the import of '%s' ended with code %d\n",
+                     settings.model.c_str(), end.code);
+        return end.code;
+    }
+}
+
+int run(int argc, char** argv, host::HostLog& hostLog) {
     base::CmdLineOptions options;
-    const HostSwitches switches = registerSwitches(options);
-    const host::AnimationSwitches animation = host::registerAnimationSwitches(options);
-    const auto* extractTextures = host::registerExtractTextures(options);
+    const host::HostSwitches switches = host::registerHostSwitches(options);
+    const FeatureSwitches more = registerFeatureSwitches(options);
     base::string error;
     base::vector<base::string> positional;
-    if (!options.parse(argc, argv, error, &positional))
+    if (!host::parseCommandLine(options, argc, argv, positional, error))
         return usageError(error);
-    if (switches.help->isSet() && switches.help->value()) {
+    if (host::isOn(switches.help)) {
         printUsage(stdout);
         std::fputs("\n", stdout);
         const base::string help = options.helpText(100);
         std::fwrite(help.data(), 1, help.size(), stdout);
         return exitImported;
     }
-    if (positional.size() != 1)
-        return usageError(positional.empty() ? "no model given" : "more than one model given");
-    base::string model = positional.front();
-
     if (switches.verbose->isSet())
-        hostLog.setShownLevel(switches.verbose->values().empty()
-                                  ? int(base::logInfo)
-                                  : std::clamp(switches.verbose->value(), 0, int(base::logDebug)));
-    else if (switches.quiet->isSet() && switches.quiet->value())
+        hostLog.setShownLevel(switches.verbose->values().empty() ? int(base::logInfo)
+                                                                 : switches.verbose->value());
+    else if (host::isOn(switches.quiet))
         hostLog.setShownLevel(base::logError);
 
-    const base::string* output = nullptr;
+    if (const auto* read = more.read; read->isSet()) {
+        if (!positional.empty())
+            return usageError("--read takes no model");
+        const base::string output =
+            switches.output->isSet() ? switches.output->values().front() : base::string();
+        if (!output.empty() && output != "-" && host::sameFile(read->value(), output))
+            return usageError(base::format("the output '{}' is the document itself", output));
+        const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
+        return host::readBack(read->value(), output, summary, hostLog);
+    }
+    if (positional.size() != 1)
+        return usageError(positional.empty() ? "no model given" : "more than one model given");
+
+    host::ImportSettings settings;
+    settings.model = positional.front();
+    settings.modulePath =
+        switches.plugin->isSet() ? switches.plugin->value() : host::ModuleLoader::defaultPath();
     if (switches.output->isSet()) {
-        output = &switches.output->values().front();
-        if (output->empty())
+        settings.output = switches.output->values().front();
+        if (settings.output.empty())
             return usageError("-o needs a file name or '-'");
     }
-    const bool toStdout = output && *output == "-";
-    host::preview::PreviewRequest preview;
-    if (!host::preview::readSwitches(switches.preview, model, preview, error))
-        return usageError(error);
-    base::vector<host::ListKind> listed;
-    if (switches.list->isSet() && !host::parseListKinds(switches.list->value(), listed, error))
-        return usageError(error);
-    const bool wantSummary =
-        switches.summary->isSet() ? switches.summary->value() : !output && listed.empty();
+    const bool toFile = !settings.output.empty() && settings.output != "-";
+    if (toFile && host::sameFile(settings.model, settings.output))
+        return usageError(base::format("the output '{}' is the model itself", settings.output));
 
     // Option values that do not fit their attribute are usage errors; find
     // them before the import rather than after it.
@@ -278,135 +228,48 @@ int run(int argc, char** argv, HostLog& hostLog) {
         !scene::apply_command_line(options, probe, scene::sceneImporter_schema::type(), error))
         return usageError(error);
 
-    if (!host::insideArchive(model) && !checkModel(model, error))
-        return failure(error);
-
-    // The module must outlive the factory: the factory's descriptors live in it.
-    host::ModuleLoader module;
-    base::ref<base::PluginFactory> factory(
-        new base::PluginFactory(factoryName(model, toStdout ? nullptr : output)));
-    scene::register_scene_schema(*factory);
-    const base::string modulePath =
-        switches.plugin->isSet() ? switches.plugin->value() : host::ModuleLoader::defaultPath();
-    if (!module.load(modulePath, *factory, error))
-        return failure(error);
-
-    base::ref<base::IPlugin> importer =
-        factory->create(importerType, base::PluginFactory::createNullIfUnknown |
-                                          base::PluginFactory::createReportUnknown |
-                                          base::PluginFactory::createUnregistered);
-    auto* sceneImporter = importer ? static_cast<scene::ISceneImporter*>(importer->queryInterface(
-                                         scene::ISceneImporter::interfaceName()))
-                                   : nullptr;
-    if (!sceneImporter)
-        return failure(
-            base::format("the module '{}' offers no {} importer", modulePath, importerType));
-
-    if (!host::chooseArchiveModel(*factory, base::name_id(importerType), model, error))
-        return failure(error);
-    sceneImporter->describeOptions(*importer);
-    if (!scene::apply_command_line(options, *importer, scene::sceneImporter_schema::type(), error))
+    FeatureRequests requests;
+    if (!host::preview::readSwitches(more.preview, settings.model, requests.preview, error))
         return usageError(error);
-    // Options only this importer reads; set only when given so its own
-    // defaults stay in charge otherwise.
-    if (switches.flipTextureCoordinates->isSet())
-        importer->setAttribute<bool>(base::name_id("importFlipTextureCoordinates"),
-                                     switches.flipTextureCoordinates->value());
-    if (switches.flipFaceWinding->isSet())
-        importer->setAttribute<bool>(base::name_id("importFlipFaceWinding"),
-                                     switches.flipFaceWinding->value());
+    if (more.list->isSet() && !host::parseListKinds(more.list->value(), requests.listed, error))
+        return usageError(error);
+    requests.reports = !requests.listed.empty() || more.animation.frames->isSet();
 
-    hostLog.clearLastError();
-    const auto started = std::chrono::steady_clock::now();
-    const bool imported = sceneImporter->import(*factory, model);
-    const double seconds =
-        std::chrono::duration<double>(std::chrono::steady_clock::now() - started).count();
-    if (!imported) {
-        const base::string reason = hostLog.lastError();
-        return failure(reason.empty()
-                           ? base::format("cannot import '{}': assimp does not read it", model)
-                           : base::format("cannot import '{}': {}", model, reason));
+    // A member of an archive is checked when the archive is opened.
+    if (!host::insideArchive(settings.model))
+        if (const base::string problem = host::modelProblem(settings.model); !problem.empty())
+            return failure(problem);
+    if (toFile)
+        if (const base::string problem = host::outputProblem(settings.output); !problem.empty())
+            return failure(problem);
+
+    // Listing stands in for the summary unless --summary asks for both.
+    const bool wantSummary = switches.summary->isSet()
+                                 ? switches.summary->value()
+                                 : settings.output.empty() && requests.listed.empty();
+    const base::vector<host::SceneFeature> features =
+        sceneFeatures(switches, more, requests, settings.output, wantSummary);
+    if (host::isOn(switches.noIsolation)) {
+        host::ImportRecord record;
+        return host::importScene(settings, options, hostLog, features, record);
     }
-
-    if (base::IPlugin* sceneObject = newestOfType(*factory, scene::names::scene))
-        if (!scene::apply_command_line(options, *sceneObject, scene::scene_schema::type(), error))
-            return usageError(error);
-
-    if (animation.time->isSet())
-        host::playAt(*factory, animation.time->value());
-
-    int code = exitImported;
-    if (switches.validate->isSet() && switches.validate->value()) {
-        // Findings are warnings and errors; show them even under -q.
-        const int shown = hostLog.shownLevel();
-        hostLog.setShownLevel(std::max(shown, int(base::logWarning)));
-        const ValidationResult result = validateMeshes<scene::IMesh>(*factory);
-        hostLog.setShownLevel(shown);
-        std::FILE* to = toStdout ? stderr : stdout;
-        if (!result.available)
-            std::fputs("validate: mesh validation is not available in this build\n", to);
-        else
-            std::fprintf(to, "validate: %u meshes checked, %u failed\n", result.checked,
-                         result.failed);
-        if (result.failed)
-            code = exitInvalid;
-    }
-
-    if (output) {
-        base::Stream stream;
-        if (toStdout) {
-            stream = host::stdoutStream();
-        } else {
-            try {
-                stream = base::fs::master().open(
-                    *output, base::fs::openWrite | base::fs::openCreate | base::fs::openTruncate);
-            } catch (const base::exception& e) {
-                return failure(base::format("cannot write '{}': {}", *output, e.message()));
-            }
-        }
-        const bool written = base::writeFactory(*factory, stream);
-        stream.close();
-        if (!written)
-            return failure(base::format("writing '{}' failed", toStdout ? "<stdout>" : *output));
-    }
-
-    if (!preview.path.empty()) {
-        const base::IPlugin* sceneObject = newestOfType(*factory, scene::names::scene);
-        if (!sceneObject)
-            return failure(base::format("'{}' gave no scene to preview", model));
-        if (!host::preview::writePreview(*factory, *sceneObject, preview.path, preview.options,
-                                         error))
-            return failure(error);
-    }
-
-    // --list and --frames print on standard output after the scene is written
-    // (on standard error when the scene itself goes to standard output).
-    const base::string report = host::animationReport(*factory, animation, listed);
-    std::fwrite(report.data(), 1, report.size(), toStdout ? stderr : stdout);
-    if (host::runExtractTextures(extractTextures, *factory, toStdout ? stderr : stdout))
-        code = exitFailed;
-
-    if (wantSummary) {
-        const base::string text = host::formatSummary(host::collectStats(*factory), seconds) +
-                                  host::animationSummary(*factory);
-        std::fwrite(text.data(), 1, text.size(), toStdout || !report.empty() ? stderr : stdout);
-    }
-    return code;
+    return importIsolated(settings, options, hostLog, features, isolationLimits(switches));
 }
 
 } // namespace
 
 int main(int argc, char** argv) {
     std::setlocale(LC_ALL, "");
-    HostLog hostLog;
+    // A closed pipe or a file-size limit ends a write with an error the host
+    // reports, instead of killing it.
+    std::signal(SIGPIPE, SIG_IGN);
+    std::signal(SIGXFSZ, SIG_IGN);
+    host::HostLog hostLog;
     base::ScopedLog scoped(hostLog);
     try {
         return run(argc, argv, hostLog);
     } catch (const base::exception& e) {
-        // The log line is the one-line reason; it reaches standard error.
-        base::logFormatted(base::logAll, base::logCritical, "scene-import| {} ({})", e.message(),
-                           e.function());
-        return exitFailed;
+        return failure(e.message());
     } catch (const std::exception& e) {
         return failure(e.what());
     } catch (...) {

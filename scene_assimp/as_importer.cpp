@@ -16,6 +16,7 @@
 #include <assimp/scene.h>
 
 #include <cctype>
+#include <optional>
 #include <string_view>
 
 namespace as {
@@ -48,30 +49,26 @@ struct InstalledLogger {
     InstalledLogger& operator=(const InstalledLogger&) = delete;
 };
 
+// Whether the text after the last '.' of the path's last component (split
+// on '/' and '\\') is 'extension', in any letter case.
+bool extensionIs(std::string_view path, std::string_view extension) noexcept {
+    if (const auto slash = path.find_last_of("/\\"); slash != std::string_view::npos)
+        path.remove_prefix(slash + 1);
+    const auto dot = path.rfind('.');
+    if (dot == std::string_view::npos || path.size() - dot - 1 != extension.size())
+        return false;
+    for (std::size_t i = 0; i < extension.size(); ++i)
+        if (std::tolower(static_cast<unsigned char>(path[dot + 1 + i])) != extension[i])
+            return false;
+    return true;
+}
+
 void logFatal(const base::string& path) noexcept {
     try {
         base::logFormatted(base::logScene, base::logCritical,
                            "assimp import |{}| Fatal error during the scene loading!", path);
     } catch (...) {
     }
-}
-
-// Whether the text after the last '.' of the path's last component is
-// 'lowerCase' in any case.
-bool hasExtension(const base::string& path, std::string_view lowerCase) {
-    std::string_view file(path);
-    if (const auto slash = file.find_last_of("/\\"); slash != std::string_view::npos)
-        file.remove_prefix(slash + 1);
-    const auto dot = file.rfind('.');
-    if (dot == std::string_view::npos)
-        return false;
-    const std::string_view extension = file.substr(dot + 1);
-    if (extension.size() != lowerCase.size())
-        return false;
-    for (std::size_t i = 0; i < lowerCase.size(); ++i)
-        if (std::tolower(static_cast<unsigned char>(extension[i])) != lowerCase[i])
-            return false;
-    return true;
 }
 
 } // namespace
@@ -124,25 +121,44 @@ ImportFlags importFlags(const base::AttribMap& options) {
         remove(aiComponent_CAMERAS);
     if (optionIs(options, S::importAnimations(), false))
         remove(aiComponent_ANIMATIONS);
+    // On unless switched off: assimp's checker turns many inconsistent scenes,
+    // which its later steps would crash on, into a clean rejection.
+    if (!optionIs(options, S::importValidate(), false))
+        out.flags |= aiProcess_ValidateDataStructure;
     return out;
 }
 
+bool structureCheckIsTolerable(std::string_view reason) noexcept {
+    constexpr std::string_view tolerable[] = {
+        "aiScene::mNumMeshes is 0",
+        "contains no faces",
+        "contains no vertices",
+        "has no corresponding node in the scene graph",
+        "A node of the scene-graph is nullptr",
+    };
+    for (std::string_view text : tolerable)
+        if (reason.find(text) != std::string_view::npos)
+            return true;
+    return false;
+}
+
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
-                         const base::string& path) {
+                         const base::string& path, bool check) {
     const ImportFlags flags = importFlags(options);
     if (flags.removesComponents())
         importer.SetPropertyInteger(AI_CONFIG_PP_RVC_FLAGS, int(flags.components));
     // A compressed file is read by the name of its content ("a.ply.gz" as
     // "a.ply"), so assimp picks its reader by the real extension.
-    return importer.ReadFile(base::fs::innerName(path).c_str(), flags.flags);
+    return importer.ReadFile(base::fs::innerName(path).c_str(),
+                             check ? flags.flags : flags.flags & ~aiProcess_ValidateDataStructure);
 }
 
 std::uint8_t upAxisForPath(const base::string& path) {
-    return hasExtension(path, "blend") ? 2 : 1;
+    return extensionIs(path, "blend") ? 2 : 1;
 }
 
 bool cameraPositionInNode(const base::string& path) {
-    return hasExtension(path, "gltf") || hasExtension(path, "glb");
+    return extensionIs(path, "gltf") || extensionIs(path, "glb");
 }
 
 base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginFactory& factory) {
@@ -210,6 +226,7 @@ void AssimpImporter::describeOptions(base::AttribMap& options) {
         options.setAttribute(S::importCameras(), S::importCamerasDefault());
         options.setAttribute(S::importHair(), S::importHairDefault());
         options.setAttribute(S::importAnimations(), S::importAnimationsDefault());
+        options.setAttribute(S::importValidate(), S::importValidateDefault());
         options.setClassName(S::type());
     } catch (const base::exception& e) {
         e.log(base::log());
@@ -224,12 +241,26 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
     // fatal line.
     try {
         Assimp::Importer importer;
+        std::optional<Assimp::Importer> unchecked;
         importer.SetIOHandler(new AssimpIO());
         InstalledLogger logger;
 
         const aiScene* source = nullptr;
         try {
             source = readScene(importer, *this, path);
+            // A file the structure check rejects for a shape valid files
+            // have is read again without it, so no valid scene is lost. A
+            // fresh importer: one whose check failed keeps freed state.
+            if (!source && (importFlags(*this).flags & aiProcess_ValidateDataStructure) &&
+                structureCheckIsTolerable(importer.GetErrorString())) {
+                base::logFormatted(
+                    base::logScene, base::logInfo,
+                    "assimp import |{}| Reading again without the structure check: {}", path,
+                    importer.GetErrorString());
+                unchecked.emplace();
+                unchecked->SetIOHandler(new AssimpIO());
+                source = readScene(*unchecked, *this, path, false);
+            }
         } catch (...) {
             // Nothing was read (assimp gave up, for instance out of memory):
             // a failure, not an empty success.
@@ -246,7 +277,7 @@ bool AssimpImporter::import(base::PluginFactory& factory, const base::string& pa
             logFatal(path);
         }
         releaseImportState();
-        importer.FreeScene();
+        (unchecked ? *unchecked : importer).FreeScene();
         return true;
     } catch (...) {
         releaseImportState();

@@ -45,10 +45,17 @@ struct ImportFlags {
 // option that is absent or of another type changes nothing.
 ImportFlags importFlags(const base::AttribMap& options);
 
+// Whether a rejection by assimp's structure check names a shape that the
+// conversion handles and that the readers produce for valid files: a scene
+// without meshes, a mesh without faces (a point cloud) or without vertices,
+// a light or camera without a node, a hole in the node tree.
+bool structureCheckIsTolerable(std::string_view reason) noexcept;
+
 // Sets up 'importer' for the options held by 'options' (flag word and
-// removed components) and reads the file: what the import runs.
+// removed components) and reads the file: what the import runs. 'check'
+// false leaves assimp's structure check out whatever the options say.
 const aiScene* readScene(Assimp::Importer& importer, const base::AttribMap& options,
-                         const base::string& path);
+                         const base::string& path, bool check = true);
 
 // The "node" objects of 'factory' by name, in registration order: a name
 // already taken keeps its first node.

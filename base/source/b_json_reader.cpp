@@ -516,6 +516,24 @@ struct JSONAttrReader::Impl {
         return true;
     }
 
+    // A number beyond its type's range reads as a double parser reads it:
+    // too small becomes the nearest value (0 or a denormal), too large for
+    // a float becomes infinite; beyond the double range it is an error.
+    template <class N>
+    N outOfRange(const char* first, const char* last) {
+        long double wide = 0;
+        const auto w = std::from_chars(first, last, wide);
+        if (w.ec == std::errc() && std::fabs(wide) <= std::numeric_limits<double>::max())
+            return N(double(wide));
+        if (w.ec != std::errc()) {
+            const std::string_view digits(first, std::size_t(last - first));
+            const std::size_t e = digits.find_first_of("eE");
+            if (e != std::string_view::npos && e + 1 < digits.size() && digits[e + 1] == '-')
+                return N(*first == '-' ? -0.0 : 0.0);
+        }
+        fail(rapidjson::kParseErrorNumberTooBig);
+    }
+
     template <class N>
     bool number(N& value) {
         if (next() != Token::number)
@@ -526,6 +544,10 @@ struct JSONAttrReader::Impl {
         std::from_chars_result r;
         if constexpr (std::is_floating_point_v<N>) {
             r = std::from_chars(first, last, parsed);
+            if (r.ec == std::errc::result_out_of_range && r.ptr == last) {
+                parsed = outOfRange<N>(first, last);
+                r.ec = std::errc();
+            }
         } else {
             // from_chars takes no sign for unsigned types and would take the
             // leading digits of "1.5"; integers must be the whole text.

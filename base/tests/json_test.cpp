@@ -337,6 +337,36 @@ TEST(JsonNumbers, DoublesAndIntegersReadBackExactly) {
     EXPECT_EQ(numberText(TimeCode(-46186158000)), "-46186158000");
 }
 
+// Beyond a type's range a number reads as a double parser reads it: too
+// small is the nearest value, too large for a float is infinite; beyond the
+// double range it is a syntax error, not a silently dropped value.
+TEST(JsonNumbers, FloatingValuesOutOfRangeReadAsTheNearest) {
+    struct Row {
+        const char* text;
+        double asDouble, asFloat;
+    };
+    const double inf = std::numeric_limits<double>::infinity();
+    const Row rows[] = {{"1e-50", 1e-50, 0.0},   {"-1e-50", -1e-50, -0.0}, {"1e-400", 0.0, 0.0},
+                        {"-1e-400", -0.0, -0.0}, {"1e-310", 1e-310, 0.0},  {"1e-5000", 0.0, 0.0},
+                        {"1e39", 1e39, inf},     {"1.5e300", 1.5e300, inf}};
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.text);
+        TypedAttribute<double> d(9);
+        TypedAttribute<float> f(9);
+        ASSERT_TRUE(fromJson(d, row.text));
+        ASSERT_TRUE(fromJson(f, row.text));
+        EXPECT_EQ(std::bit_cast<std::uint64_t>(d.value()),
+                  std::bit_cast<std::uint64_t>(row.asDouble));
+        EXPECT_EQ(std::bit_cast<std::uint32_t>(f.value()),
+                  std::bit_cast<std::uint32_t>(float(row.asFloat)));
+    }
+    for (const char* text : {"1e400", "-1e400", "1e5000"}) {
+        TypedAttribute<double> d(9);
+        EXPECT_THROW(fromJson(d, text), JSONException) << text;
+        EXPECT_EQ(d.value(), 9);
+    }
+}
+
 TEST(JsonNumbers, IntegersOutOfRangeOrWithFractionsDoNotRead) {
     struct Row {
         std::function<bool()> read;

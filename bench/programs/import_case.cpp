@@ -12,8 +12,10 @@
 //   preview     the whole import, then a preview image of the scene written
 //               as PNG (--preview OUT, default <model>.png); its time is
 //               printed apart
+//   unchecked   the whole import with assimp's structure validation switched
+//               off ("importValidate" false), to price the validation step
 //
-//   import_case <read|read-plain|import|json|preview> <model> [--module PATH]
+//   import_case <read|read-plain|import|json|preview|unchecked> <model> [--module PATH]
 //               [--json OUT] [--preview OUT] [--size N] [--trace MS]
 //
 // Output, one line: "<case> seconds=<wall> cpu=<user+sys> peak_kib=<VmHWM> ..."
@@ -59,9 +61,10 @@ using Clock = std::chrono::steady_clock;
 
 // The flag word the importer reads with when no option changes it, and the
 // same with assimp's vertex join.
-constexpr unsigned importerDefaultFlags = aiProcess_GenSmoothNormals | aiProcess_FindInstances;
+constexpr unsigned importerDefaultFlags =
+    aiProcess_GenSmoothNormals | aiProcess_FindInstances | aiProcess_ValidateDataStructure;
 constexpr unsigned joinedFlags = importerDefaultFlags | aiProcess_JoinIdenticalVertices;
-static_assert(joinedFlags == 0x100042);
+static_assert(joinedFlags == 0x100442);
 
 long statusKib(const char* field) {
     std::ifstream status("/proc/self/status");
@@ -162,7 +165,7 @@ struct PreviewCase {
 
 // Cases "import", "json" and "preview".
 void runImport(const std::string& model, const std::string& modulePath, const std::string& json,
-               int tracePeriod, const PreviewCase& preview = {}) {
+               int tracePeriod, const PreviewCase& preview = {}, bool validate = true) {
     using LoadEntry = int (*)(base::PluginFactory&);
     using UnloadEntry = int (*)();
 
@@ -197,6 +200,8 @@ void runImport(const std::string& model, const std::string& modulePath, const st
         if (!sceneImporter)
             fail("the module offers no AssimpImporter");
         sceneImporter->describeOptions(*importer);
+        if (!validate)
+            importer->setAttribute(base::name_id("importValidate"), false);
 
         trace.mark("import");
         // The host heap holds everything the conversion makes (assimp's own
@@ -253,8 +258,9 @@ void runImport(const std::string& model, const std::string& modulePath, const st
     std::printf("%s seconds=%.4f cpu=%.4f peak_kib=%ld objects=%zu meshes=%zu import_seconds=%.4f "
                 "preview_seconds=%.4f heap_peak_kib=%zu\n",
                 !preview.path.empty() ? "preview"
-                : json.empty()        ? "import"
-                                      : "json",
+                : !json.empty()       ? "json"
+                : validate            ? "import"
+                                      : "unchecked",
                 seconds, cpu, peak, objects, meshes, importSeconds, previewSeconds,
                 heapPeak / 1024);
 }
@@ -263,10 +269,11 @@ void runImport(const std::string& model, const std::string& modulePath, const st
 
 int main(int argc, char** argv) {
     if (argc < 3) {
-        std::fprintf(stderr,
-                     "usage: %s <read|read-plain|import|json|preview> <model> [--module PATH] "
-                     "[--json OUT] [--preview OUT] [--size N] [--trace MS]\n",
-                     argv[0]);
+        std::fprintf(
+            stderr,
+            "usage: %s <read|read-plain|import|json|preview|unchecked> <model> [--module PATH] "
+            "[--json OUT] [--preview OUT] [--size N] [--trace MS]\n",
+            argv[0]);
         return 2;
     }
     const std::string which = argv[1], model = argv[2];
@@ -302,7 +309,9 @@ int main(int argc, char** argv) {
             if (preview.path.empty())
                 preview.path = model + ".png";
             runImport(model, modulePath, {}, tracePeriod, preview);
-        } else if (which == "json")
+        } else if (which == "unchecked")
+            runImport(model, modulePath, {}, tracePeriod, {}, false);
+        else if (which == "json")
             runImport(model, modulePath, json.empty() ? model + ".json" : json, tracePeriod);
         else
             fail("unknown case '" + which + "'");

@@ -1,6 +1,10 @@
 #include "preview_switches.h"
 
 #include "b_format.h"
+#include "scene_preview.h"
+#include "scene_schema.h"
+
+#include <cstdio>
 
 namespace host::preview {
 
@@ -46,6 +50,19 @@ bool readSwitches(const PreviewSwitches& switches, const base::string& model,
     const std::size_t slash = model.find_last_of('/');
     request.options.modelFolder = slash == base::string::npos ? "./" : model.substr(0, slash + 1);
     return true;
+}
+
+int previewFeature(const base::PluginFactory& factory, const PreviewRequest& request) {
+    const base::IPlugin* sceneObject = nullptr;
+    for (std::uint32_t id = factory.pluginCount(); id-- > 0 && !sceneObject;)
+        if (base::ref<base::IPlugin> object = factory.plugin(id);
+            object && object->className() == scene::names::scene)
+            sceneObject = object.get();
+    base::string error = "the model gave no scene to preview";
+    if (sceneObject && writePreview(factory, *sceneObject, request.path, request.options, error))
+        return 0;
+    std::fprintf(stderr, "scene-import: %s\n", error.c_str());
+    return 1;
 }
 
 } // namespace host::preview

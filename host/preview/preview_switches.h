@@ -25,4 +25,8 @@ struct PreviewRequest {
 bool readSwitches(const PreviewSwitches& switches, const base::string& model,
                   PreviewRequest& request, base::string& error);
 
+// Writes the preview of the factory's newest scene; 0, or 1 after printing
+// the reason on standard error.
+int previewFeature(const base::PluginFactory& factory, const PreviewRequest& request);
+
 } // namespace host::preview

@@ -11,7 +11,8 @@
 #     and look along the directions that assimp's scene implies,
 #   - every material but assimp's default one is there with its textures,
 #   - animated nodes, played at five times per animation, take the poses
-#     that interpolating assimp's keys gives.
+#     that interpolating assimp's keys gives,
+#   - the document read back with --read and written again is the same bytes.
 #
 # usage: corpus_sweep.sh SCENE_IMPORT ASSIMP_REFERENCE CORPUS_DIR
 # Environment: SWEEP_JOBS (2), SWEEP_TIMEOUT seconds per file (300),
@@ -73,13 +74,19 @@ sweep_one() {
     timeout -k 10 "$limit" "$host" -q "$file" -o "$json" --list cameras,lights \
         >"$out/listing" 2>"$err"
     local hc=$?
-    local rc detail=""
+    local rc detail="" again=ok
     if [ $hc -eq 0 ]; then
         detail=$(timeout -k 10 "$limit" "$reference" "$file" "$json" "$out/listing" 2>&1)
+        rc=$?
+        timeout -k 10 "$limit" "$host" -q --read "$json" -o "$out/again.json" >/dev/null 2>>"$err"
+        local ac=$?
+        if [ $ac -ne 0 ]; then again="read back: exit $ac"
+        elif ! cmp -s "$json" "$out/again.json"; then again="read back: $(cmp "$json" "$out/again.json" | head -1)"
+        else again="ok $(stat -c %s "$json")"; fi
     else
         timeout -k 10 "$limit" "$reference" "$file" >/dev/null 2>&1
+        rc=$?
     fi
-    rc=$?
     local verdict reason=""
     [ $rc -eq 4 ] && reason=$(awk -F'\t' -v f="$rel" '$1 == f { print $2; exit }' "$explained")
     if [ $hc -eq 124 ] || [ $hc -eq 137 ]; then
@@ -108,6 +115,9 @@ sweep_one() {
         verdict=frame-mismatch
     elif [ $hc -eq 0 ] && [ $rc -eq 7 ]; then
         verdict=material-mismatch
+    elif [ $hc -eq 0 ] && [[ $again != ok* ]]; then
+        verdict=round-trip
+        detail=$again
     elif [ $hc -eq 0 ] && [[ "$detail" == *"playback-times:"* ]]; then
         local times=${detail##*playback-times: }
         times=${times%%$'\n'*}
@@ -117,9 +127,10 @@ sweep_one() {
         else
             verdict=playback-mismatch
         fi
-        detail="${detail%%playback-times:*} $played"
+        detail="${detail%%playback-times:*} $played; round trip $again"
     elif [ $hc -eq 0 ]; then
         verdict=imported
+        detail="$detail; round trip $again"
     else
         verdict=rejected
     fi
@@ -175,7 +186,11 @@ count() { awk -F'\t' -v v="$1" '$1 == v' "$work/results" | wc -l; }
 files=$(wc -l <"$work/results")
 imported=$(($(count imported) + $(count mesh-mismatch) + $(count mesh-differs) +
     $(count mesh-unstable) + $(count bad-json) +
-    $(count frame-mismatch) + $(count playback-mismatch) + $(count material-mismatch)))
+    $(count frame-mismatch) + $(count playback-mismatch) + $(count material-mismatch) +
+    $(count round-trip)))
+roundtrip=$(count round-trip)
+same=$(grep -c 'round trip ok' "$work/results")
+bytes=$(grep -o 'round trip ok [0-9]*' "$work/results" | awk '{ s += $4 } END { print s + 0 }')
 rejected=$(count rejected)
 mismatches=$(count mismatch)
 crashes=$(count crash)
@@ -190,9 +205,10 @@ read -r compared differ < <(awk -F'\t' '$1 != "mesh-unstable" && match($5, /mesh
         split(substr($5, RSTART, RLENGTH), w, " "); c += w[2]; d += w[4] }
     END { print c + 0, d + 0 }' "$work/results")
 framediff=$(count frame-mismatch)
-# "frames: cameras N lights M ..." of every imported file, summed.
-read -r cameras lights < <(grep -o 'frames: cameras [0-9]* lights [0-9]*' "$work/results" |
-    awk '{c += $3; l += $5} END {print c + 0, l + 0}')
+# "frames: cameras N lights M (K on animated nodes)" of every imported file,
+# summed; the K objects under animated nodes are judged by the playback check.
+read -r cameras lights onanimated < <(grep -o 'frames: cameras [0-9]* lights [0-9]* ([0-9]*' \
+    "$work/results" | tr -d '(' | awk '{c += $3; l += $5; a += $6} END {print c + 0, l + 0, a + 0}')
 playdiff=$(count playback-mismatch)
 played=$(grep -c 'playback: [0-9]* checked' "$work/results")
 
@@ -203,11 +219,14 @@ awk -F'\t' '$1 != "imported" && $1 != "rejected"' "$work/results" | sort |
 echo "corpus sweep: files $files, imported $imported, rejected $rejected," \
      "mismatches $mismatches, crashes $crashes, hangs $hangs, bad JSON $badjson," \
      "mesh counts checked $checked, mesh-count mismatches $meshdiff," \
-     "cameras $cameras, lights $lights, camera/light frame mismatches $framediff," \
+     "cameras $cameras, lights $lights ($onanimated on animated nodes)," \
+     "camera/light frame mismatches $framediff," \
      "animated files played $played, playback mismatches $playdiff," \
-     "materials checked $materialschecked, material mismatches $materialdiff, seconds $seconds"
+     "materials checked $materialschecked, material mismatches $materialdiff," \
+     "read back identical $same ($bytes bytes), read-back differences $roundtrip, seconds $seconds"
 echo "welding: $compared meshes compared with assimp's join, $differ differ" \
      "($(awk -v c="$compared" -v d="$differ" 'BEGIN { printf "%.2f", c ? 100 * (c - d) / c : 100 }') % agree)"
 
-[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff + playdiff + materialdiff)) -eq 0 ] &&
+[ $((mismatches + crashes + hangs + badjson + meshdiff + framediff + playdiff + materialdiff +
+    roundtrip)) -eq 0 ] &&
     [ $((differ * 100)) -le "$compared" ]

@@ -49,13 +49,17 @@ protected:
         fs::create_directories(m_dir / "folder.obj");
         std::ofstream(m_dir / "empty.obj").close();
         std::ofstream(m_dir / "noise.xyz") << "this is not a model of any kind\n";
+        fs::create_symlink(m_dir / "noise.xyz", m_dir / "symlink.xyz");
+        fs::create_hard_link(m_dir / "noise.xyz", m_dir / "hardlink.xyz");
     }
     void TearDown() override { fs::remove_all(m_dir); }
 
     // Runs scene-import with 'args' through the shell, its standard error captured
     // in a file.
-    HostRun run(std::vector<std::string> args) {
-        std::string command = "'" SCENE_IMPORT_EXE "'";
+    // 'prefix' and 'suffix' wrap the command line (a limit, a pipe).
+    HostRun run(std::vector<std::string> args, const std::string& prefix = {},
+                const std::string& suffix = {}) {
+        std::string command = prefix + "'" SCENE_IMPORT_EXE "'";
         for (std::string& a : args) {
             if (a.starts_with("{tmp}"))
                 a = (m_dir / a.substr(6)).string();
@@ -65,7 +69,8 @@ protected:
         }
         const fs::path errPath = m_dir / "stderr";
         HostRun run;
-        FILE* pipe = popen((command + " 2>'" + errPath.string() + "' </dev/null").c_str(), "r");
+        FILE* pipe =
+            popen((command + " 2>'" + errPath.string() + "' </dev/null" + suffix).c_str(), "r");
         if (!pipe)
             return run;
         char buffer[4096];
@@ -129,7 +134,45 @@ INSTANTIATE_TEST_SUITE_P(
         ExitCase{"BadListKind", {"--list", "planets", "{sample}"}, 2, "planets"},
         ExitCase{"ModuleMissing", {"--plugin", "{tmp}/none.so", "{sample}"}, 1, "none.so"},
         ExitCase{
-            "UnwritableOutput", {"{sample}", "-o", "{tmp}/no/such/out.json"}, 1, "cannot write"}),
+            "OutputFolderMissing", {"{sample}", "-o", "{tmp}/no/such/out.json"}, 1, "the folder '"},
+        ExitCase{"OutputIsAFolder", {"{sample}", "-o", "{tmp}/folder.obj"}, 1, "it is a folder"},
+        // Refused before anything is read, whatever the spelling.
+        ExitCase{"OutputIsTheModel", {"{tmp}/noise.xyz", "-o", "{tmp}/noise.xyz"}, 2, "itself"},
+        ExitCase{"OutputIsTheModelSpelledOtherwise",
+                 {"{tmp}/noise.xyz", "-o", "{tmp}/folder.obj/.././noise.xyz"},
+                 2,
+                 "itself"},
+        ExitCase{"OutputIsASymlinkToTheModel",
+                 {"{tmp}/noise.xyz", "-o", "{tmp}/symlink.xyz"},
+                 2,
+                 "itself"},
+        ExitCase{"OutputIsAHardLinkToTheModel",
+                 {"{tmp}/hardlink.xyz", "-o", "{tmp}/noise.xyz"},
+                 2,
+                 "itself"},
+        // Values outside what a switch allows name the switch and the values.
+        ExitCase{
+            "UpAxisNotAnAxis", {"-upAxis", "7", "{sample}"}, 2, "'-upAxis'. Expected one of x"},
+        ExitCase{"NormalsNotAChoice",
+                 {"-importNormals", "9", "{sample}"},
+                 2,
+                 "'-importNormals'. Expected one of none"},
+        ExitCase{"TessellationBeyondFloat",
+                 {"-importTessellation", "1e999", "{sample}"},
+                 2,
+                 "'-importTessellation'. Expected a finite number"},
+        ExitCase{"NegativeTimeout",
+                 {"--timeout", "-5", "{sample}"},
+                 2,
+                 "'--timeout'. Expected a whole number from 0"},
+        ExitCase{"NegativeMemory", {"--max-memory", "-1", "{sample}"}, 2, "'--max-memory'"},
+        ExitCase{"VerbosityTooHigh", {"-v", "9", "{sample}"}, 2, "from 0 to 5"},
+        ExitCase{
+            "WordAfterVerbose", {"-v", "abc", "{sample}"}, 2, "unexpected value 'abc' after -v"},
+        ExitCase{"WordAfterValidate",
+                 {"{sample}", "--validate", "abc"},
+                 2,
+                 "unexpected value 'abc' after --validate"}),
     [](const auto& info) { return std::string(info.param.name); });
 
 // ---- Output ----
@@ -174,7 +217,7 @@ TEST_F(HostTest, SummaryOfTheSampleUnlessWritingAFile) {
 
 // The sample's "Bend" animation lifts Pivot from y 0 to 0.5 and back over 1 s.
 TEST_F(HostTest, AnimationPlaysAtTimesAndSamplesFrames) {
-    HostRun r = run({"{sample}", "--time", "0.5", "--list", "poses"});
+    HostRun r = run({"{sample}", "--time", "0.5", "--list", "poses", "--summary"});
     ASSERT_EQ(r.code, 0) << r.err;
     EXPECT_NE(r.out.find("\nPivot 2 0.5 0 "), std::string::npos) << r.out;
     EXPECT_NE(r.err.find("animation: 2 clips, 1 layers, 12 channels, 0 s to 1 s"),
@@ -406,6 +449,121 @@ TEST(Listing, WorldFramesThroughTheNodeTree) {
     EXPECT_EQ(kinds.size(), 2u);
     EXPECT_FALSE(host::parseListKinds("cameras,", kinds, error));
     EXPECT_NE(error.find("''"), base::string::npos) << error;
+}
+
+// A failed import states its reason once, in the host's words.
+TEST_F(HostTest, FailureReasonOnceWithoutTags) {
+    for (const bool isolated : {true, false}) {
+        std::vector<std::string> args{"{tmp}/noise.xyz"};
+        if (!isolated)
+            args.insert(args.begin(), "--no-isolation");
+        const HostRun r = run(args);
+        EXPECT_EQ(r.code, 1);
+        EXPECT_NE(r.err.find("scene-import: cannot import '"), std::string::npos) << r.err;
+        EXPECT_EQ(r.err.find("assimp|"), std::string::npos) << r.err;
+        EXPECT_EQ(r.err.find("::"), std::string::npos) << r.err;
+        const std::size_t reason = r.err.rfind(": ");
+        ASSERT_NE(reason, std::string::npos);
+        const std::string text = r.err.substr(reason + 2, 30);
+        EXPECT_EQ(r.err.find(text), reason + 2) << "the reason is repeated:\n" << r.err;
+    }
+}
+
+// A document is written whole or not at all: a write that fails part-way
+// (here at a file-size limit) leaves the previous file and no temporary one.
+TEST_F(HostTest, FailedWriteKeepsThePreviousDocument) {
+    const fs::path out = m_dir / "out.json";
+    std::ofstream(out) << "previous";
+    for (const char* isolation : {"", "--no-isolation"}) {
+        std::vector<std::string> args{"{sample}", "-o", "{tmp}/out.json"};
+        if (*isolation)
+            args.push_back(isolation);
+        const HostRun r = run(args, "prlimit --fsize=4096 ");
+        EXPECT_EQ(r.code, 1) << r.err;
+        EXPECT_NE(r.err.find("File too large"), std::string::npos) << r.err;
+        EXPECT_EQ(readFile(out), "previous");
+        for (const auto& entry : fs::directory_iterator(m_dir))
+            EXPECT_FALSE(entry.path().string().ends_with(".tmp")) << entry.path();
+    }
+    const HostRun r = run({"{sample}", "-o", "{tmp}/out.json"});
+    EXPECT_EQ(r.code, 0) << r.err;
+    EXPECT_EQ(readFile(out).front(), '{');
+}
+
+// Writing into a pipe that closes early is a write error, not death by SIGPIPE.
+TEST_F(HostTest, ClosedPipeIsAWriteError) {
+    // A grid big enough that its document outgrows any pipe buffer.
+    {
+        std::ofstream grid(m_dir / "grid.obj");
+        constexpr int n = 150;
+        for (int y = 0; y <= n; ++y)
+            for (int x = 0; x <= n; ++x)
+                grid << "v " << x << ' ' << y << " 0\n";
+        for (int y = 0; y < n; ++y)
+            for (int x = 0; x < n; ++x) {
+                const int a = y * (n + 1) + x + 1;
+                grid << "f " << a << ' ' << a + 1 << ' ' << a + n + 2 << ' ' << a + n + 1 << '\n';
+            }
+    }
+    // The host's own status, not head's.
+    std::ofstream(m_dir / "pipe.sh")
+        << "'" SCENE_IMPORT_EXE "' '" << (m_dir / "grid.obj").string() << "' -o - 2>'"
+        << (m_dir / "err").string() << "' | head -c 100 >/dev/null; exit ${PIPESTATUS[0]}\n";
+    const int status = std::system(("bash '" + (m_dir / "pipe.sh").string() + "'").c_str());
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 1);
+    EXPECT_NE(readFile(m_dir / "err").find("Broken pipe"), std::string::npos)
+        << readFile(m_dir / "err");
+}
+
+// ---- Read-back ----
+
+// Import, write, read, write: the same bytes.
+TEST_F(HostTest, ReadBackWritesTheSameDocument) {
+    ASSERT_EQ(run({"{sample}", "-o", "{tmp}/first.json"}).code, 0);
+    const HostRun r = run({"--read", "{tmp}/first.json", "-o", "{tmp}/second.json"});
+    ASSERT_EQ(r.code, 0) << r.err;
+    const std::string first = readFile(m_dir / "first.json");
+    EXPECT_GT(first.size(), 1000u);
+    EXPECT_TRUE(first == readFile(m_dir / "second.json"));
+    const HostRun summary = run({"--read", "{tmp}/first.json"});
+    EXPECT_EQ(summary.code, 0) << summary.err;
+    EXPECT_EQ(summaryLines(summary.out)["node"], 11);
+}
+
+// Broken documents: a clear error with its line, exit 1, what can be read is
+// read and written.
+TEST_F(HostTest, ReadBackOfBrokenDocuments) {
+    struct Row {
+        const char* name;
+        const char* text;
+        const char* stderrHas;
+        bool written;
+    };
+    const Row rows[] = {
+        {"truncated", "{\n\"node\": {\n\t\"name^string\": \"a\",\n", "json parser", true},
+        {"unknown type", "{\n\"node\": {\"name^string\": \"a\"},\n\"frob\": {}\n}\n", "frob", true},
+        {"missing reference", "{\n\"scene\": {\n\t\"root^plugin\": \"nowhere\"\n}\n}\n", "nowhere",
+         true},
+        {"wrong value type", "{\n\"node\": {\n\t\"visible^bool\": \"yes\"\n}\n}\n", "at line 3",
+         true},
+        {"beyond double", "{\n\"node\": {\n\t\"x^double\": 1e400\n}\n}\n", "json parser", true},
+        {"not json", "garbage", "json parser", true},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.name);
+        std::ofstream(m_dir / "doc.json") << row.text;
+        fs::remove(m_dir / "out.json");
+        const HostRun r = run({"--read", "{tmp}/doc.json", "-o", "{tmp}/out.json"});
+        EXPECT_EQ(r.code, 1) << r.err;
+        EXPECT_NE(r.err.find(row.stderrHas), std::string::npos) << r.err;
+        EXPECT_EQ(fs::exists(m_dir / "out.json"), row.written);
+    }
+    // A float below its range reads as the nearest value instead of being dropped.
+    std::ofstream(m_dir / "doc.json") << "{\n\"node\": {\n\t\"tiny^float\": 1e-50\n}\n}\n";
+    const HostRun r = run({"--read", "{tmp}/doc.json", "-o", "-"});
+    EXPECT_EQ(r.code, 0) << r.err;
+    EXPECT_NE(r.out.find("\"tiny^float\": 0"), std::string::npos) << r.out;
 }
 
 // ---- Scene counts ----

@@ -487,10 +487,12 @@ void projectNode(const View& view, const IPlugin& node, const mat43& parent, std
         const IPlugin* mesh = child.get();
         if (mesh->className() == names::skin)
             mesh = mesh->findAttribute<PluginRef>(names::baseMesh)->get();
-        if (mesh->className() != names::mesh) {
+        if (mesh->className() == names::node) {
             projectNode(view, *mesh, world, size, mask);
             continue;
         }
+        if (mesh->className() != names::mesh)
+            continue; // cameras and lights draw nothing
         const auto& positions = *mesh->findVecAttribute<vec3f>(names::positions);
         const auto indices = scene::decodeMeshIndices(*mesh);
         for (std::size_t i = 0; i + 2 < indices.size(); i += 3) {

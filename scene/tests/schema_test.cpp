@@ -54,8 +54,8 @@ const SchemaAttr* findAttr(std::string_view type, std::string_view attr) {
 TEST_F(Schema, NameSetsHaveTheirCountsAndShareConstants) {
     EXPECT_EQ(schemaNames().size(), 584u);
     EXPECT_EQ(textsOf(schemaNames()).size(), 584u);
-    EXPECT_EQ(textsOf(importerSchemaNames()).size(), 34u);
-    EXPECT_EQ(importerSchemaNames().size(), 34u);
+    EXPECT_EQ(textsOf(importerSchemaNames()).size(), 35u);
+    EXPECT_EQ(importerSchemaNames().size(), 35u);
     EXPECT_EQ(textsOf(exporterSchemaNames()).size(), 17u);
 
     std::map<std::string_view, base::name_id*> core;
@@ -239,7 +239,8 @@ TEST_F(Schema, StructsAreInTableOrderWithTheirBases) {
                                                          "compressionMethod",
                                                          "compressionLevel",
                                                          "includeResources",
-                                                         "textColumns"};
+                                                         "textColumns",
+                                                         "importValidate"};
     const std::vector<std::string_view> nodeOrder = {
         "name",          "children",       "bounds",          "visible",
         "animate",       "motionBlur",     "transformation",  "inheritsTransform",
@@ -364,7 +365,7 @@ TEST_F(Schema, LabelsOfDecidedAndMixedTypes) {
 
 TEST_F(Schema, CommandLineSwitchesFollowTheOptions) {
     auto rows = importerCommandLineOptions();
-    ASSERT_EQ(rows.size(), 25u);
+    ASSERT_EQ(rows.size(), 26u);
     std::set<std::string_view> enums = {"importMultiIndex", "importNormals", "computeNormalsMethod",
                                         "importTangents", "computeTangentsMethod"};
     for (const auto& r : rows) {
@@ -378,7 +379,7 @@ TEST_F(Schema, CommandLineSwitchesFollowTheOptions) {
         EXPECT_FALSE(r.help.empty());
     }
     EXPECT_EQ(rows.front().option, "-keepInSync");
-    EXPECT_EQ(rows.back().option, "-importPoints");
+    EXPECT_EQ(rows.back().option, "-importValidate");
     EXPECT_NE(rows[2].help.find("done on te fly"), std::string_view::npos);
     EXPECT_EQ(rows[7].help, "Whether to import the mesh vertex colors. ");
 }

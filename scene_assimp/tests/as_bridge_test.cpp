@@ -44,9 +44,21 @@ TEST(AssimpLogger, FoldsRunsOfEqualMessages) {
           {&L::OnError, "other"},
           {&L::OnError, "other"}},
          {{3, "assimp| same"}, {4, skipping}, {2, "assimp| other"}, {4, skipping}}},
-        {"alternating",
-         {{&L::OnInfo, "a"}, {&L::OnDebug, "b"}, {&L::OnVerboseDebug, "a"}},
-         {{4, "assimp| a"}, {5, "assimp| b"}, {5, "assimp| a"}}},
+        // A message that comes back after others is counted, and its count
+        // (at its most severe level) closes the import.
+        {"interleaved",
+         {{&L::OnInfo, "a"},
+          {&L::OnDebug, "b"},
+          {&L::OnWarn, "a"},
+          {&L::OnWarn, "a"},
+          {&L::OnDebug, "b"},
+          {&L::OnInfo, "c"},
+          {&L::OnInfo, "a"}},
+         {{4, "assimp| a"},
+          {5, "assimp| b"},
+          {4, "assimp| c"},
+          {3, "assimp| a (repeated 3 more times)"},
+          {5, "assimp| b (repeated 1 more time)"}}},
         {"emptyFirst", {{&L::OnError, ""}, {&L::OnError, ""}}, {{4, skipping}}},
     };
     for (const LoggerCase& c : cases) {

@@ -53,7 +53,8 @@ TEST(AssimpEntry, DescribesItsOptionsWithTheirDefaults) {
     scene::query<scene::ISceneImporter>(*object)->describeOptions(options);
     EXPECT_EQ(options.className(), base::name_id("sceneImporter"));
 
-    EXPECT_EQ(options.size(), 12u);
+    EXPECT_EQ(options.size(), 13u);
+    EXPECT_TRUE(scene::get<bool>(options, base::name_id("importValidate"), false));
     // The values reach the flag word (see the Options cases); hair has no flag.
     EXPECT_EQ(scene::get<std::uint8_t>(options, base::name_id("importNormals"), 9), 2);
     EXPECT_TRUE(scene::get<bool>(options, base::name_id("importHair"), false));

@@ -69,24 +69,27 @@ TEST_P(FlagTest, ReachesAssimp) {
 INSTANTIATE_TEST_SUITE_P(
     Options, FlagTest,
     testing::Values(
-        FlagRow{"Defaults", with<bool>({}), 0x100040, 0},
-        FlagRow{"Nothing", [](base::AttribMap&) {}, 0x100000, 0},
+        FlagRow{"Defaults", with<bool>({}), 0x100440, 0},
+        FlagRow{"Nothing", [](base::AttribMap&) {}, 0x100400, 0},
         FlagRow{"NoMaterialsNoCameras",
-                with<bool>({{"importMaterials", false}, {"importCameras", false}}), 0x100050,
+                with<bool>({{"importMaterials", false}, {"importCameras", false}}), 0x100450,
                 0xA00},
         FlagRow{"NoNormalsComputedTangents",
-                with<std::uint8_t>({{"importNormals", 0}, {"importTangents", 2}}), 0x100011, 0x2},
+                with<std::uint8_t>({{"importNormals", 0}, {"importTangents", 2}}), 0x100411, 0x2},
         FlagRow{"FileNormalsNoTangents",
-                with<std::uint8_t>({{"importNormals", 1}, {"importTangents", 0}}), 0x100010, 0x4},
-        FlagRow{"UnknownEnumerationValue", with<std::uint8_t>({{"importNormals", 7}}), 0x100000, 0},
+                with<std::uint8_t>({{"importNormals", 1}, {"importTangents", 0}}), 0x100410, 0x4},
+        FlagRow{"UnknownEnumerationValue", with<std::uint8_t>({{"importNormals", 7}}), 0x100400, 0},
         FlagRow{"FlipAndTriangulate",
                 with<bool>({{"importFlipTextureCoordinates", true},
                             {"importFlipFaceWinding", true},
                             {"importTriangulateMeshes", true}}),
-                0x1900048, 0},
+                0x1900448, 0},
         FlagRow{"FlipStoredAsInteger", with<std::int32_t>({{"importFlipTextureCoordinates", 1}}),
-                0x100040, 0},
-        FlagRow{"NormalsStoredAsBool", with<bool>({{"importNormals", true}}, false), 0x100000, 0},
+                0x100440, 0},
+        FlagRow{"NormalsStoredAsBool", with<bool>({{"importNormals", true}}, false), 0x100400, 0},
+        FlagRow{"ValidationOff", with<bool>({{"importValidate", false}}), 0x100040, 0},
+        FlagRow{"ValidateStoredAsInteger", with<std::int32_t>({{"importValidate", 0}}, false),
+                0x100400, 0},
         FlagRow{"EverythingRemoved",
                 with<bool>({{"importMeshes", false},
                             {"importTextureCoordinates", false},
@@ -96,7 +99,7 @@ INSTANTIATE_TEST_SUITE_P(
                             {"importMaterials", false},
                             {"importCameras", false},
                             {"importAnimations", false}}),
-                0x100050, 0xF78}),
+                0x100450, 0xF78}),
     [](const testing::TestParamInfo<FlagRow>& info) { return info.param.label; });
 
 // ---- upAxis ----
@@ -222,6 +225,33 @@ TEST_F(ImportFixture, BadInputAnswersFalseAndLeavesNoLogger) {
     }
     EXPECT_TRUE(objectsOf("scene").empty());
     EXPECT_TRUE(objectsOf("node").empty());
+}
+
+// The structure check rejects shapes that valid files have (a point cloud
+// has no faces); those files are read again without it and still import,
+// while an inconsistent scene stays rejected.
+TEST_F(ImportFixture, StructureCheckLosesNoValidScene) {
+    const std::string points = write("points.obj", "v 0 0 0\nv 1 0 0\nv 0 1 0\n");
+    EXPECT_TRUE(import(points));
+    EXPECT_EQ(objectsOf("scene").size(), 1u);
+    struct Row {
+        const char* reason;
+        bool tolerable;
+    };
+    const Row rows[] = {
+        {"Validation failed: aiScene::mNumMeshes is 0. At least one mesh must be there", true},
+        {"Validation failed: Mesh  contains no faces", true},
+        {"Validation failed: The mesh emptySolid contains no vertices", true},
+        {"Validation failed: aiScene::mLights[1] has no corresponding node in the scene graph "
+         "(light1)",
+         true},
+        {"Validation failed: A node of the scene-graph is nullptr", true},
+        {"Validation failed: aiMesh::mFaces[0]::mIndices[0] is out of range", false},
+        {"Validation failed: aiMesh::mBones[0] is nullptr", false},
+        {"", false},
+    };
+    for (const Row& row : rows)
+        EXPECT_EQ(as::structureCheckIsTolerable(row.reason), row.tolerable) << row.reason;
 }
 
 // A "node" type whose objects cannot be made: the conversion fails midway.
