@@ -12,6 +12,7 @@
 #include "b_exception.h"
 #include "b_format.h"
 #include "b_log.h"
+#include "batch.h"
 #include "host_log.h"
 #include "host_options.h"
 #include "isolation.h"
@@ -26,6 +27,7 @@
 #include "scene_interfaces.h"
 #include "texture_extract.h"
 
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -39,8 +41,11 @@ enum ExitCode : int { exitImported = 0, exitFailed = 1, exitUsage = 2, exitInval
 
 void printUsage(std::FILE* to) {
     std::fputs("usage: scene-import [switches] MODEL [-o OUT.json]\n"
+               "       scene-import [switches] MODEL... [-o OUTDIR/]\n"
+               "       scene-import [switches] --batch DIR [-o OUTDIR/]\n"
                "Imports MODEL with the assimp importer module and writes the scene as JSON\n"
-               "(-o - writes it to standard output).\n",
+               "(-o - writes it to standard output). Several models, or --batch, convert\n"
+               "each one in its own process and print a table of the results.\n",
                to);
 }
 
@@ -174,10 +179,65 @@ int importIsolated(const host::ImportSettings& settings, const base::CmdLineOpti
     }
 }
 
+// Option values that do not fit their attribute are usage errors; find them
+// before the import rather than after it.
+bool optionsFit(const base::CmdLineOptions& options, base::string& error) {
+    base::AttribMap probe;
+    return scene::apply_command_line(options, probe, scene::scene_schema::type(), error) &&
+           scene::apply_command_line(options, probe, scene::sceneImporter_schema::type(), error);
+}
+
+// Several models: each child imports one with the features a batch allows
+// (--time, --validate, the document).
+int runBatch(const host::HostSwitches& switches, const FeatureSwitches& more,
+             const host::BatchSwitches& batch, const base::CmdLineOptions& options,
+             const base::vector<base::string>& positional, host::HostLog& hostLog) {
+    for (const base::CmdLineOption* single :
+         {static_cast<const base::CmdLineOption*>(more.list),
+          static_cast<const base::CmdLineOption*>(more.animation.frames),
+          static_cast<const base::CmdLineOption*>(more.preview.output),
+          static_cast<const base::CmdLineOption*>(more.extractTextures),
+          static_cast<const base::CmdLineOption*>(switches.summary),
+          static_cast<const base::CmdLineOption*>(switches.noIsolation)})
+        if (single->isSet())
+            return usageError(base::format("{} takes a single model", single->name()));
+    host::BatchSettings settings;
+    settings.models = positional;
+    if (batch.folder->isSet())
+        settings.folder = batch.folder->value();
+    if (switches.output->isSet()) {
+        settings.outputFolder = switches.output->values().front();
+        if (settings.outputFolder.empty() || settings.outputFolder == "-")
+            return usageError("-o names a folder when converting several models");
+        struct stat info {};
+        if (::stat(settings.outputFolder.c_str(), &info) == 0 && !S_ISDIR(info.st_mode))
+            return usageError(base::format("-o '{}' is not a folder; several models need one",
+                                           settings.outputFolder));
+    }
+    if (batch.report->isSet())
+        settings.report = batch.report->value();
+    if (settings.report.empty() && batch.report->isSet())
+        return usageError("--report needs a file name");
+    settings.modulePath =
+        switches.plugin->isSet() ? switches.plugin->value() : host::ModuleLoader::defaultPath();
+    settings.jobs = batch.jobs->isSet() ? unsigned(batch.jobs->value()) : host::defaultJobs();
+    settings.limits = isolationLimits(switches);
+    settings.quiet = host::isOn(switches.quiet);
+    settings.childMessages = switches.verbose->isSet();
+    const FeatureRequests requests;
+    return host::runBatch(settings,
+                          [&](const host::ImportSettings& one, host::ImportRecord& record) {
+                              const base::vector<host::SceneFeature> features =
+                                  sceneFeatures(switches, more, requests, one.output, false);
+                              return host::importScene(one, options, hostLog, features, record);
+                          });
+}
+
 int run(int argc, char** argv, host::HostLog& hostLog) {
     base::CmdLineOptions options;
     const host::HostSwitches switches = host::registerHostSwitches(options);
     const FeatureSwitches more = registerFeatureSwitches(options);
+    const host::BatchSwitches batch = host::registerBatchSwitches(options);
     base::string error;
     base::vector<base::string> positional;
     if (!host::parseCommandLine(options, argc, argv, positional, error))
@@ -205,6 +265,13 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
         return host::readBack(read->value(), output, summary, hostLog);
     }
+    if (host::wantsBatch(batch, positional.size(),
+                         switches.output->isSet() ? switches.output->values().front()
+                                                  : base::string())) {
+        if (!optionsFit(options, error))
+            return usageError(error);
+        return runBatch(switches, more, batch, options, positional, hostLog);
+    }
     if (positional.size() != 1)
         return usageError(positional.empty() ? "no model given" : "more than one model given");
 
@@ -221,11 +288,7 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
     if (toFile && host::sameFile(settings.model, settings.output))
         return usageError(base::format("the output '{}' is the model itself", settings.output));
 
-    // Option values that do not fit their attribute are usage errors; find
-    // them before the import rather than after it.
-    base::AttribMap probe;
-    if (!scene::apply_command_line(options, probe, scene::scene_schema::type(), error) ||
-        !scene::apply_command_line(options, probe, scene::sceneImporter_schema::type(), error))
+    if (!optionsFit(options, error))
         return usageError(error);
 
     FeatureRequests requests;

@@ -1,0 +1,308 @@
+#include "batch.h"
+
+#include "archive_input.h"
+#include "b_format.h"
+#include "batch_report.h"
+#include "module_loader.h"
+#include "output_file.h"
+#include "scene_importer.h"
+#include "scene_interfaces.h"
+#include "stream/b_fs_archive.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <memory>
+#include <set>
+#include <thread>
+
+namespace host {
+
+namespace fs = std::filesystem;
+
+namespace {
+
+// The extensions the importer's descriptor lists, read in the host itself.
+bool importerExtensions(const base::string& modulePath, base::string& extensions,
+                        base::string& error) {
+    ModuleLoader module;
+    base::ref<base::PluginFactory> factory(new base::PluginFactory("batch"));
+    scene::register_scene_schema(*factory);
+    if (!module.load(modulePath, *factory, error))
+        return false;
+    base::ref<base::IPluginDesc> desc = factory->descriptor(base::name_id("AssimpImporter"));
+    auto* importer = dynamic_cast<scene::IScenePluginDesc*>(desc.get());
+    if (!importer) {
+        error = base::format("the module '{}' offers no AssimpImporter importer", modulePath);
+        return false;
+    }
+    extensions = importer->supportedExtensions();
+    return true;
+}
+
+// Creates the output folder and proves it takes files, before any import.
+base::string prepareFolder(const base::string& folder) {
+    std::error_code failure;
+    fs::create_directories(fs::path(folder.c_str()), failure);
+    if (failure)
+        return base::format("cannot create the output folder '{}': {}", folder, failure.message());
+    base::string probe = base::format("{}/.scene-import-XXXXXX", folder);
+    const int fd = ::mkstemp(probe.data());
+    if (fd < 0)
+        return base::format("cannot write into the output folder '{}': {}", folder,
+                            std::strerror(errno));
+    ::close(fd);
+    ::unlink(probe.c_str());
+    return {};
+}
+
+void silenceOutput() {
+    const int null = ::open("/dev/null", O_WRONLY | O_CLOEXEC);
+    if (null < 0)
+        return;
+    ::dup2(null, STDOUT_FILENO);
+    ::dup2(null, STDERR_FILENO);
+    ::close(null);
+}
+
+// Turns how the child ended into its record's status and reason.
+void judge(const ChildEnd& end, ImportRecord& record) {
+    const base::string model = record.model;
+    decodeRecord(end.record, record);
+    record.model = model;
+    record.seconds = end.seconds;
+    record.peakKiB = end.peakKiB;
+    switch (end.kind) {
+    case ChildEnd::exited:
+        if (end.code == 0 && !imported(record)) {
+            record.status = "failed";
+            record.reason = "the import gave no record";
+        } else if (end.code > 3) {
+            // A code the import never answers (a sanitizer's report).
+            record.status = "failed";
+            record.reason = base::format("the import ended with code {}", end.code);
+        }
+        break;
+    case ChildEnd::signalled:
+        record.status = "crashed";
+        record.reason = base::format("assimp crashed reading it ({})", signalText(end.code));
+        break;
+    case ChildEnd::timedOut:
+        record.status = "timeout";
+        record.reason = base::format("assimp hung reading it: gave up after {} s", end.code);
+        break;
+    case ChildEnd::notStarted:
+        record.status = "failed";
+        record.reason = end.failure;
+        break;
+    }
+    if (!imported(record) && record.status != "invalid")
+        record.output.clear();
+}
+
+} // namespace
+
+BatchSwitches registerBatchSwitches(base::CmdLineOptions& options) {
+    BatchSwitches s;
+    s.folder = options.addValue<base::string>(
+        "--batch", {},
+        "Import every model file below this folder (with -o OUTDIR/, each to "
+        "OUTDIR/<relative path>.json).");
+    s.jobs = options.addValue<std::int64_t>(
+        "-j", "--jobs", "Run this many imports at once in a batch (default: the number of cores).");
+    s.report = options.addValue<base::string>(
+        "--report", {}, "Write the batch's per-file records as JSON to this file.");
+    return s;
+}
+
+bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::string& output) {
+    return switches.folder->isSet() || switches.report->isSet() || models > 1 ||
+           (!output.empty() && output.back() == '/');
+}
+
+bool collectModels(const base::string& folder, std::string_view extensions,
+                   const base::string& skip, base::vector<BatchInput>& inputs,
+                   base::string& error) {
+    const fs::path root(folder.c_str());
+    std::error_code failure;
+    fs::recursive_directory_iterator it(root, fs::directory_options::skip_permission_denied,
+                                        failure);
+    if (failure) {
+        error = base::format("cannot read the folder '{}': {}", folder, failure.message());
+        return false;
+    }
+    base::vector<BatchInput> found;
+    for (; it != fs::recursive_directory_iterator(); it.increment(failure)) {
+        if (failure)
+            break;
+        const fs::directory_entry& entry = *it;
+        std::error_code ignored;
+        const base::string path(entry.path().string());
+        if (entry.is_directory(ignored)) {
+            // Documents written into a folder inside the input are not inputs.
+            if (!skip.empty() && sameFile(path, skip))
+                it.disable_recursion_pending();
+            continue;
+        }
+        if (!entry.is_regular_file(ignored) ||
+            !base::fs::hasExtensionIn(base::fs::innerName(path), extensions))
+            continue;
+        found.push_back({path, base::string(entry.path().lexically_relative(root).string()), {}});
+    }
+    if (failure) {
+        error = base::format("cannot read the folder '{}': {}", folder, failure.message());
+        return false;
+    }
+    std::sort(found.begin(), found.end(),
+              [](const BatchInput& a, const BatchInput& b) { return a.name < b.name; });
+    inputs.insert(inputs.end(), found.begin(), found.end());
+    return true;
+}
+
+base::vector<base::string> assignOutputs(base::vector<BatchInput>& inputs,
+                                         const base::string& folder) {
+    base::vector<base::string> notes;
+    std::set<base::string> taken;
+    base::string prefix = folder;
+    if (!prefix.empty() && prefix.back() != '/')
+        prefix += '/';
+    for (BatchInput& input : inputs) {
+        const base::string wanted = prefix + input.name + ".json";
+        input.output = wanted;
+        for (unsigned n = 2; !taken.insert(input.output).second; ++n)
+            input.output = base::format("{}{}-{}.json", prefix, input.name, n);
+        if (input.output != wanted)
+            notes.push_back(base::format("'{}' would also be written to '{}'; it goes to '{}'",
+                                         input.model, wanted, input.output));
+    }
+    return notes;
+}
+
+int runBatch(const BatchSettings& settings, const BatchImport& import) {
+    auto fail = [](const base::string& message) {
+        std::fprintf(stderr, "scene-import: %s\n", message.c_str());
+        return 1;
+    };
+    if (!settings.outputFolder.empty())
+        if (const base::string problem = prepareFolder(settings.outputFolder); !problem.empty())
+            return fail(problem);
+    if (!settings.report.empty())
+        if (const base::string problem = outputProblem(settings.report); !problem.empty())
+            return fail(problem);
+
+    base::vector<BatchInput> inputs;
+    for (const base::string& model : settings.models)
+        inputs.push_back({model, base::string(fs::path(model.c_str()).filename().string()), {}});
+    base::string error;
+    if (!settings.folder.empty()) {
+        base::string extensions;
+        if (!importerExtensions(settings.modulePath, extensions, error) ||
+            !collectModels(settings.folder, extensions, settings.outputFolder, inputs, error))
+            return fail(error);
+        if (inputs.empty())
+            return fail(base::format("'{}' holds no model the importer reads", settings.folder));
+    }
+    if (!settings.outputFolder.empty())
+        for (const base::string& note : assignOutputs(inputs, settings.outputFolder))
+            if (!settings.quiet)
+                std::fprintf(stderr, "scene-import: %s\n", note.c_str());
+
+    const auto started = std::chrono::steady_clock::now();
+    base::vector<ImportRecord> records(inputs.size());
+    base::vector<base::string> names(inputs.size());
+    BatchProgress progress(stderr, BatchProgress::modeFor(settings.quiet), inputs.size());
+
+    struct Running {
+        std::size_t index;
+        std::unique_ptr<IsolatedChild> child;
+    };
+    base::vector<Running> running;
+    std::size_t next = 0;
+    auto start = [&](std::size_t i) {
+        const BatchInput& input = inputs[i];
+        ImportRecord& record = records[i];
+        record.model = input.model;
+        names[i] = input.name;
+        // A member of an archive is checked when the archive is opened.
+        base::string problem =
+            insideArchive(input.model) ? base::string() : modelProblem(input.model);
+        std::error_code failure;
+        if (problem.empty() && !input.output.empty())
+            if (fs::create_directories(fs::path(input.output.c_str()).parent_path(), failure);
+                failure)
+                problem = base::format("cannot create the folder of '{}': {}", input.output,
+                                       failure.message());
+        if (!problem.empty()) {
+            record.reason = std::move(problem);
+            progress.finished(input.name, record);
+            return;
+        }
+        ImportSettings one{input.model, input.output, settings.modulePath};
+        const bool quietChild = !settings.childMessages;
+        running.push_back({i, std::make_unique<IsolatedChild>(
+                                  settings.limits, [&, one, quietChild](int recordFd) {
+                                      if (quietChild)
+                                          silenceOutput();
+                                      ImportRecord own;
+                                      const int code = import(one, own);
+                                      const base::string text = encodeRecord(own);
+                                      [[maybe_unused]] const ssize_t ignored =
+                                          ::write(recordFd, text.data(), text.size());
+                                      return code;
+                                  })});
+    };
+    while (next < inputs.size() || !running.empty()) {
+        while (next < inputs.size() && running.size() < std::max(1u, settings.jobs))
+            start(next++);
+        if (running.empty())
+            continue;
+        base::vector<IsolatedChild*> children;
+        for (const Running& r : running)
+            children.push_back(r.child.get());
+        IsolatedChild::waitAny(children, std::chrono::milliseconds(100));
+        for (auto it = running.begin(); it != running.end();) {
+            if (!it->child->done()) {
+                ++it;
+                continue;
+            }
+            const ChildEnd& end = it->child->end();
+            ImportRecord& record = records[it->index];
+            judge(end, record);
+            // The partial document of a child that died.
+            if (end.kind != ChildEnd::exited && !inputs[it->index].output.empty())
+                ::unlink(temporaryPath(inputs[it->index].output, end.pid).c_str());
+            progress.finished(names[it->index], record);
+            it = running.erase(it);
+        }
+        progress.tick(running.empty() ? base::string() : names[running.front().index]);
+    }
+    progress.clear();
+
+    const double seconds =
+        std::chrono::duration<double>(std::chrono::steady_clock::now() - started).count();
+    const base::string table = formatTable(records, names, seconds);
+    std::fwrite(table.data(), 1, table.size(), stdout);
+    std::fflush(stdout);
+    int code = std::all_of(records.begin(), records.end(), imported) ? 0 : 1;
+    if (!settings.report.empty()) {
+        const base::string json = reportJson(records, seconds);
+        if (!writeAtomically(
+                settings.report,
+                [&](base::Stream& stream) {
+                    return stream.write(json.data(), json.size()) == json.size();
+                },
+                error))
+            code = fail(error);
+    }
+    return code;
+}
+
+unsigned defaultJobs() {
+    return std::max(1u, std::thread::hardware_concurrency());
+}
+
+} // namespace host
