@@ -255,11 +255,12 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
                                       return code;
                                   })});
     };
-    while (next < inputs.size() || !running.empty()) {
+    auto fill = [&] {
         while (next < inputs.size() && running.size() < std::max(1u, settings.jobs))
             start(next++);
-        if (running.empty())
-            continue;
+    };
+    fill();
+    while (!running.empty()) {
         base::vector<IsolatedChild*> children;
         for (const Running& r : running)
             children.push_back(r.child.get());
@@ -278,6 +279,8 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             progress.finished(names[it->index], record);
             it = running.erase(it);
         }
+        // The next files start before the line names what is being read.
+        fill();
         progress.tick(running.empty() ? base::string() : names[running.front().index]);
     }
     progress.clear();
