@@ -120,8 +120,7 @@ BatchSwitches registerBatchSwitches(base::CmdLineOptions& options) {
 }
 
 bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::string& output) {
-    return switches.folder->isSet() || switches.report->isSet() || models > 1 ||
-           (!output.empty() && output.back() == '/');
+    return switches.folder->isSet() || models > 1 || (!output.empty() && output.back() == '/');
 }
 
 bool collectModels(const base::string& folder, std::string_view extensions,

@@ -25,8 +25,8 @@ struct BatchSwitches {
 
 BatchSwitches registerBatchSwitches(base::CmdLineOptions& options);
 
-// Whether the command line asks for a batch: --batch, --report, more than
-// one model, or an output that names a folder ("out/").
+// Whether the command line asks for a batch: --batch, more than one model,
+// or an output that names a folder ("out/").
 bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::string& output);
 
 struct BatchInput {

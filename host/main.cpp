@@ -272,8 +272,12 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
             return usageError(error);
         return runBatch(switches, more, batch, options, positional, hostLog);
     }
-    if (positional.size() != 1)
-        return usageError(positional.empty() ? "no model given" : "more than one model given");
+    // A report lists the files of a batch; with one model and -o FILE the
+    // document's path would be taken for a folder.
+    if (batch.report->isSet())
+        return usageError("--report needs a batch: several models, --batch DIR or -o OUTDIR/");
+    if (positional.empty())
+        return usageError("no model given");
 
     host::ImportSettings settings;
     settings.model = positional.front();
