@@ -6,6 +6,7 @@
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -82,6 +83,11 @@ IsolatedChild::IsolatedChild(const IsolationLimits& limits, const ChildJob& job)
     }
     ::close(fds[1]);
     m_end.pid = m_pid;
+#ifdef SYS_pidfd_open
+    m_pidFd = int(::syscall(SYS_pidfd_open, m_pid, 0));
+    if (m_pidFd >= 0)
+        ::fcntl(m_pidFd, F_SETFD, FD_CLOEXEC);
+#endif
     m_recordFd = fds[0];
     ::fcntl(m_recordFd, F_SETFL, ::fcntl(m_recordFd, F_GETFL) | O_NONBLOCK);
 }
@@ -93,6 +99,8 @@ IsolatedChild::~IsolatedChild() {
     }
     if (m_recordFd >= 0)
         ::close(m_recordFd);
+    if (m_pidFd >= 0)
+        ::close(m_pidFd);
 }
 
 void IsolatedChild::finish(int status, std::uint64_t peakKiB) {
@@ -113,6 +121,10 @@ void IsolatedChild::finish(int status, std::uint64_t peakKiB) {
     if (m_recordFd >= 0) {
         ::close(m_recordFd);
         m_recordFd = -1;
+    }
+    if (m_pidFd >= 0) {
+        ::close(m_pidFd);
+        m_pidFd = -1;
     }
 }
 
@@ -163,13 +175,19 @@ void IsolatedChild::poll() {
 void IsolatedChild::waitAny(std::span<IsolatedChild* const> children,
                             std::chrono::milliseconds maxWait) {
     base::vector<pollfd> fds;
-    fds.reserve(children.size());
-    for (IsolatedChild* child : children)
-        if (!child->m_done && child->m_recordFd >= 0)
+    fds.reserve(2 * children.size());
+    for (IsolatedChild* child : children) {
+        if (child->m_done)
+            continue;
+        if (child->m_recordFd >= 0)
             fds.push_back({child->m_recordFd, POLLIN, 0});
-    // A child that ended is noticed by its closed channel; the short cap
-    // covers the moment between the channel closing and the child being
-    // reapable, and the time limits.
+        if (child->m_pidFd >= 0)
+            fds.push_back({child->m_pidFd, POLLIN, 0});
+    }
+    // A child that ended is noticed by its process descriptor or, without
+    // one, by its closed channel; the short cap then covers the moment
+    // between the channel closing and the child being reapable, and the time
+    // limits.
     const int wait = int(std::min<std::int64_t>(maxWait.count(), 50));
     ::poll(fds.data(), nfds_t(fds.size()), wait);
     for (IsolatedChild* child : children)

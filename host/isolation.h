@@ -71,6 +71,9 @@ private:
 
     pid_t m_pid = -1;
     int m_recordFd = -1;
+    // Readable once the child has ended (-1 where the kernel offers none):
+    // lets a waiting host reap a child the moment it exits.
+    int m_pidFd = -1;
     bool m_done = false;
     bool m_killed = false;
     std::uint32_t m_timeout;
