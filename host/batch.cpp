@@ -240,19 +240,16 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             progress.finished(input.name, record);
             return;
         }
-        ImportSettings one{input.model, input.output, settings.modulePath};
-        const bool quietChild = !settings.childMessages;
-        running.push_back({i, std::make_unique<IsolatedChild>(
-                                  settings.limits, [&, one, quietChild](int recordFd) {
-                                      if (quietChild)
-                                          silenceOutput();
-                                      ImportRecord own;
-                                      const int code = import(one, own);
-                                      const base::string text = encodeRecord(own);
-                                      [[maybe_unused]] const ssize_t ignored =
-                                          ::write(recordFd, text.data(), text.size());
-                                      return code;
-                                  })});
+        const ImportSettings one{input.model, input.output, settings.modulePath};
+        const ChildJob job = [&, one](int recordFd) {
+            if (!settings.childMessages)
+                silenceOutput();
+            ImportRecord own;
+            const int code = import(one, own);
+            sendRecord(recordFd, own);
+            return code;
+        };
+        running.push_back({i, std::make_unique<IsolatedChild>(settings.limits, job)});
     };
     auto fill = [&] {
         while (next < inputs.size() && running.size() < std::max(1u, settings.jobs))

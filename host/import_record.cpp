@@ -2,6 +2,8 @@
 
 #include "b_format.h"
 
+#include <unistd.h>
+
 #include <charconv>
 #include <cstdlib>
 
@@ -45,6 +47,12 @@ base::string encodeRecord(const ImportRecord& r) {
     appendLine(out, "firstWarning", r.firstWarning);
     appendLine(out, "output", r.output);
     return out;
+}
+
+void sendRecord(int fd, const ImportRecord& record) {
+    const base::string text = encodeRecord(record);
+    // A host that stopped listening has no use for the record.
+    [[maybe_unused]] const ssize_t ignored = ::write(fd, text.data(), text.size());
 }
 
 void decodeRecord(std::string_view text, ImportRecord& r) {

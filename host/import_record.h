@@ -35,5 +35,7 @@ struct ImportRecord {
 // blanks), and back. Unknown keys are ignored.
 base::string encodeRecord(const ImportRecord& record);
 void decodeRecord(std::string_view text, ImportRecord& record);
+// Writes the encoded record to a child's record channel.
+void sendRecord(int fd, const ImportRecord& record);
 
 } // namespace host

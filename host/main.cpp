@@ -153,8 +153,7 @@ int importIsolated(const host::ImportSettings& settings, const base::CmdLineOpti
     const host::ChildEnd end = host::runIsolated(limits, [&](int recordFd) {
         host::ImportRecord record;
         const int code = host::importScene(settings, options, log, features, record);
-        const base::string text = host::encodeRecord(record);
-        [[maybe_unused]] const ssize_t ignored = ::write(recordFd, text.data(), text.size());
+        host::sendRecord(recordFd, record);
         return code;
     });
     if (end.kind == host::ChildEnd::exited && end.code <= exitInvalid)
