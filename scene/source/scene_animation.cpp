@@ -158,9 +158,9 @@ void channelLog(int level, const char* text, const ::base::IPlugin& channel) {
 
 // ---- Per-curve memo ----
 
-// Aligned, with the busy flag and curve 0's verdict, hint and checks at the
-// front: playback of many channels reads few cache lines per evaluation.
-struct alignas(64) IKeyframeChannel::Memo {
+// The busy flag and curve 0's verdict, hint and checks come first: playback
+// of many channels reads few cache lines per evaluation.
+struct IKeyframeChannel::Memo {
     // Entries of a curve map beyond this many are not worth resolving ahead.
     static constexpr std::size_t maxWatched = 16;
 
@@ -173,6 +173,11 @@ struct alignas(64) IKeyframeChannel::Memo {
         std::size_t count = 0;
         bool ascending = true;
         std::uint32_t hint = 0;
+        // Where the keys around the hint were last read: fetched ahead while
+        // the checks run. Only ever prefetched, never read, as they may be
+        // stale.
+        const void* nearTimes = nullptr;
+        const void* nearValues = nullptr;
 
         // The curve's entries as last found, kept while playback reads the
         // same curve again and again. Nothing tells the channel when a curve
@@ -203,6 +208,7 @@ struct alignas(64) IKeyframeChannel::Memo {
             count = 0;
             ascending = true;
             hint = 0;
+            nearTimes = nearValues = nullptr;
         }
         bool watch(const ::base::Attribute* a) {
             ::base::WatchNode& node = nodes[nodeCount];
@@ -345,6 +351,13 @@ template <class T>
 T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const {
     const MemoGuard guard(*m_memo);
     Memo::Curve* memo = guard ? m_memo->find(curveIndex) : nullptr;
+    if (memo) {
+        __builtin_prefetch(memo->nearTimes);
+        __builtin_prefetch(memo->nearValues);
+        __builtin_prefetch(memo->entries.times);
+        __builtin_prefetch(memo->entries.values);
+        __builtin_prefetch(memo->map);
+    }
     Resolved r;
     if (memo && memo->live(curveIndex)) {
         r = memo->entries;
@@ -427,8 +440,11 @@ T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const 
         return T{};
     c.hint = memo ? memo->hint : 0;
     T result = evaluateCurve(c, time);
-    if (memo)
+    if (memo) {
         memo->hint = c.hint;
+        memo->nearTimes = c.times + c.hint;
+        memo->nearValues = c.values + c.hint;
+    }
     return result;
 }
 
