@@ -1,7 +1,8 @@
 // Keyframe evaluation: 10,000 channels of 1,000 linear keys each, evaluated at
-// 1,000 times spread over the key range, either frame by frame (playback:
-// every channel at one time, then the next time) or at the same times in a
-// shuffled order (random access). Items are single evaluations.
+// 1,000 times spread over the key range: in playback order, either frame by
+// frame (every channel at one time, then the next time, as a layer plays) or
+// channel by channel (each channel through all times in turn), or at the same
+// times in a shuffled order (random access). Items are single evaluations.
 #include "scene_interfaces.h"
 
 #include "b_log.h"
@@ -75,6 +76,16 @@ void playback(benchmark::State& state) {
 }
 
 template <class T, int channelCount = 10000, int keyCount = 1000>
+void playbackPerChannel(benchmark::State& state) {
+    auto& data = channelsOf<T, channelCount, keyCount>();
+    for (auto _ : state)
+        for (const auto& channel : data.channels)
+            for (TimeCode t : data.times)
+                benchmark::DoNotOptimize(channel->template computeValue<T>(0, t));
+    state.SetItemsProcessed(std::int64_t(state.iterations()) * channelCount * timeCount);
+}
+
+template <class T, int channelCount = 10000, int keyCount = 1000>
 void randomAccess(benchmark::State& state) {
     auto& data = channelsOf<T, channelCount, keyCount>();
     std::vector<TimeCode> times = data.times;
@@ -87,6 +98,7 @@ void randomAccess(benchmark::State& state) {
 }
 
 BENCHMARK(playback<base::vec3f>)->Unit(benchmark::kMillisecond)->Iterations(2);
+BENCHMARK(playbackPerChannel<base::vec3f>)->Unit(benchmark::kMillisecond)->Iterations(2);
 BENCHMARK(randomAccess<base::vec3f>)->Unit(benchmark::kMillisecond)->Iterations(2);
 BENCHMARK(playback<float>)->Unit(benchmark::kMillisecond)->Iterations(2);
 BENCHMARK(playback<base::vec3f, 500, 100>)->Unit(benchmark::kMillisecond)->Iterations(20);

@@ -18,6 +18,7 @@
 #include <cmath>
 #include <cstring>
 #include <limits>
+#include <memory>
 #include <string>
 
 namespace scene {
@@ -95,12 +96,47 @@ const ::base::ArrayOf<T>* arrayOf(const ::base::Attribute* a) {
     return static_cast<const ::base::ArrayOf<T>*>(a->data());
 }
 
+// The typed storage behind a curve's entries (null where an entry is absent
+// or of another type), as the evaluation reads it.
+struct Resolved {
+    const std::uint8_t* pre = nullptr;
+    const std::uint8_t* post = nullptr;
+    const std::uint8_t* mode = nullptr;
+    const float* tension = nullptr;
+    const float* tightness = nullptr;
+    const ::base::ArrayOf<std::uint8_t>* modes = nullptr;
+    const ::base::ArrayOf<TimeCode>* times = nullptr;
+    const void* values = nullptr; // an ArrayOf of 'valuesType'
+    ::base::name_id valuesType;   // empty without values
+    const ::base::ArrayOf<float>* tangents = nullptr;
+    const ::base::ArrayOf<float>* weights = nullptr;
+    bool weightsPresent = false;
+};
+
 template <class T>
-bool scalarOf(const ::base::Attribute* a, T& out) {
-    if (!a || a->typeName() != ::base::TypeTraits<T>::n_name)
-        return false;
-    out = *static_cast<const T*>(a->data());
-    return true;
+const T* scalarData(const ::base::Attribute* a) {
+    return a && a->typeName() == ::base::TypeTraits<T>::n_name ? static_cast<const T*>(a->data())
+                                                               : nullptr;
+}
+
+Resolved resolve(const CurveEntries& e) {
+    Resolved r;
+    r.pre = scalarData<std::uint8_t>(e.pre);
+    r.post = scalarData<std::uint8_t>(e.post);
+    r.tension = scalarData<float>(e.tension);
+    r.tightness = scalarData<float>(e.tightness);
+    r.mode = scalarData<std::uint8_t>(e.interpolation);
+    if (!r.mode)
+        r.modes = arrayOf<std::uint8_t>(e.interpolation);
+    r.times = arrayOf<TimeCode>(e.times);
+    if (e.values) {
+        r.values = e.values->data();
+        r.valuesType = e.values->typeName();
+    }
+    r.tangents = arrayOf<float>(e.tangents);
+    r.weights = arrayOf<float>(e.weights);
+    r.weightsPresent = e.weights != nullptr;
+    return r;
 }
 
 const ::base::AttribMap* curveMap(const ::base::AttribMap& channel, std::uint32_t index) {
@@ -122,17 +158,98 @@ void channelLog(int level, const char* text, const ::base::IPlugin& channel) {
 
 // ---- Per-curve memo ----
 
+// The busy flag and curve 0's verdict, hint and checks come first: playback
+// of many channels reads few cache lines per evaluation.
 struct IKeyframeChannel::Memo {
-    struct Curve {
+    // Entries of a curve map beyond this many are not worth resolving ahead.
+    static constexpr std::size_t maxWatched = 16;
+
+    // Evaluation is a read: two threads may evaluate one channel. The memo is
+    // only an accelerator, so a busy memo is simply bypassed.
+    std::atomic_flag busy = ATOMIC_FLAG_INIT;
+
+    struct Curve : ::base::NonCopyable {
         const void* times = nullptr; // the storage the verdict belongs to
         std::size_t count = 0;
         bool ascending = true;
         std::uint32_t hint = 0;
+        // Where the keys around the hint were last read: fetched ahead while
+        // the checks run. Only ever prefetched, never read, as they may be
+        // stale.
+        const void* nearTimes = nullptr;
+        const void* nearValues = nullptr;
+
+        // The curve's entries as last found, kept while playback reads the
+        // same curve again and again. Nothing tells the channel when a curve
+        // map or its arrays change, so every attribute taken here carries a
+        // watch node, which its destructor nulls; together with the list
+        // slot and the entry count this catches any replacement, removal,
+        // insertion or addition. Values and sizes are read afresh each time.
+        bool resolved = false;
+        std::uint32_t nodeCount = 0;
+        const ::base::AttribArray* list = nullptr;
+        const ::base::AttribMap* map = nullptr;
+        std::size_t entryCount = 0;
+        Resolved entries;
+        ::base::WatchNode nodes[maxWatched + 2];
+
+        ~Curve() { forget(); }
+
+        void forget() {
+            for (std::uint32_t i = 0; i < nodeCount; ++i)
+                if (::base::Attribute* watched = nodes[i].watched)
+                    watched->removeWatch(nodes[i]);
+            nodeCount = 0;
+            resolved = false;
+        }
+        void reset() {
+            forget();
+            times = nullptr;
+            count = 0;
+            ascending = true;
+            hint = 0;
+            nearTimes = nearValues = nullptr;
+        }
+        bool watch(const ::base::Attribute* a) {
+            ::base::WatchNode& node = nodes[nodeCount];
+            node.owner = this;
+            if (!const_cast<::base::Attribute*>(a)->addWatch(node))
+                return false;
+            ++nodeCount;
+            return true;
+        }
+        // Whether the entries found earlier are still the curve's.
+        bool live(std::uint32_t index) const {
+            if (!resolved)
+                return false;
+            for (std::uint32_t i = 0; i < nodeCount; ++i)
+                if (!nodes[i].watched)
+                    return false;
+            return list->item(index) == map && map->entries().size() == entryCount && !map->base();
+        }
     };
-    ::base::vector<Curve> curves;
-    // Evaluation is a read: two threads may evaluate one channel. The memo is
-    // only an accelerator, so a busy memo is simply bypassed.
-    std::atomic_flag busy = ATOMIC_FLAG_INIT;
+
+    // Curve 0 lives here, the others (rarely more than a few) apart: watch
+    // nodes must not move.
+    Curve first;
+    ::base::vector<std::unique_ptr<Curve>> more;
+
+    Curve* find(std::uint32_t index) {
+        if (index == 0)
+            return &first;
+        return index <= more.size() ? more[index - 1].get() : nullptr;
+    }
+    Curve& at(std::uint32_t index) {
+        if (index == 0)
+            return first;
+        while (more.size() < index)
+            more.push_back(std::make_unique<Curve>());
+        return *more[index - 1];
+    }
+    void clear() {
+        first.reset();
+        more.clear();
+    }
 };
 
 IKeyframeChannel::IKeyframeChannel(::base::IPluginDesc* descriptor, ::base::PluginFactory* factory,
@@ -146,7 +263,7 @@ IKeyframeChannel::~IKeyframeChannel() {
 void IKeyframeChannel::attributeChanged(::base::name_id name, ::base::Attribute* attribute,
                                         std::uint32_t flags) {
     if (!m_memo->busy.test_and_set(std::memory_order_acquire)) {
-        m_memo->curves.clear();
+        m_memo->clear();
         m_memo->busy.clear(std::memory_order_release);
     }
     ::base::IPlugin::attributeChanged(name, attribute, flags);
@@ -154,73 +271,129 @@ void IKeyframeChannel::attributeChanged(::base::name_id name, ::base::Attribute*
 
 namespace {
 
-// Ascending check of 'times' for curve 'index', done once per storage.
-// Answers false (after logging once) for a curve whose times go backwards.
-bool timesAscending(IKeyframeChannel::Memo& memo, const IKeyframeChannel& channel,
-                    std::uint32_t index, const TimeCode* times, std::size_t n,
-                    std::uint32_t& hint) {
+// Holds the memo for one evaluation; not owning it means bypassing it.
+class MemoGuard {
+public:
+    explicit MemoGuard(IKeyframeChannel::Memo& memo)
+        : m_memo(memo), m_owned(!memo.busy.test_and_set(std::memory_order_acquire)) {}
+    ~MemoGuard() {
+        if (m_owned)
+            m_memo.busy.clear(std::memory_order_release);
+    }
+    MemoGuard(const MemoGuard&) = delete;
+    MemoGuard& operator=(const MemoGuard&) = delete;
+    explicit operator bool() const { return m_owned; }
+
+private:
+    IKeyframeChannel::Memo& m_memo;
+    bool m_owned;
+};
+
+// Takes the entries of the channel's own curve 'index' into 'c' when they can
+// be watched: no links or inheritance on the way, whose targets could change
+// elsewhere.
+void resolveCurve(IKeyframeChannel::Memo::Curve& c, const IKeyframeChannel& channel,
+                  std::uint32_t index, const Resolved& found) {
+    c.forget();
+    const ::base::Attribute* own = channel.findEntry(names::curves);
+    const ::base::AttribArray* list = own && !const_cast<::base::Attribute*>(own)->asLink()
+                                          ? const_cast<::base::Attribute*>(own)->asArray()
+                                          : nullptr;
+    ::base::Attribute* item = list ? list->item(index) : nullptr;
+    const ::base::AttribMap* map = item && !item->asLink() ? item->asMap() : nullptr;
+    if (!map || map->base() || map->entries().size() > IKeyframeChannel::Memo::maxWatched)
+        return;
+    for (const auto& entry : map->entries())
+        if (entry.second->asLink())
+            return;
+    bool watched = c.watch(list) && c.watch(map);
+    for (const auto& entry : map->entries())
+        watched = watched && c.watch(entry.second);
+    if (!watched) {
+        c.forget();
+        return;
+    }
+    c.list = list;
+    c.map = map;
+    c.entryCount = map->entries().size();
+    c.entries = found;
+    c.resolved = true;
+}
+
+// Ascending check of 'times' for curve 'c', done once per storage. Answers
+// false (after logging once) for a curve whose times go backwards.
+bool timesAscending(IKeyframeChannel::Memo::Curve* c, const IKeyframeChannel& channel,
+                    const TimeCode* times, std::size_t n) {
     auto scan = [&] {
         for (std::size_t i = 1; i < n; ++i)
             if (times[i] < times[i - 1])
                 return false;
         return true;
     };
-    if (memo.busy.test_and_set(std::memory_order_acquire)) {
-        hint = 0;
+    if (!c)
         return scan();
-    }
-    if (memo.curves.size() <= index)
-        memo.curves.resize(std::size_t(index) + 1);
-    IKeyframeChannel::Memo::Curve& c = memo.curves[index];
-    if (c.times != times || c.count != n) {
-        c.times = times;
-        c.count = n;
-        c.hint = 0;
-        c.ascending = scan();
-        if (!c.ascending)
+    if (c->times != times || c->count != n) {
+        c->times = times;
+        c->count = n;
+        c->hint = 0;
+        c->ascending = scan();
+        if (!c->ascending)
             channelLog(::base::logError,
                        "keyframeChannel |{}| The 'times' attribute is not in ascending order!",
                        channel);
     }
-    const bool ascending = c.ascending;
-    hint = c.hint;
-    memo.busy.clear(std::memory_order_release);
-    return ascending;
-}
-
-void storeHint(IKeyframeChannel::Memo& memo, std::uint32_t index, std::uint32_t hint) {
-    if (memo.busy.test_and_set(std::memory_order_acquire))
-        return;
-    if (index < memo.curves.size())
-        memo.curves[index].hint = hint;
-    memo.busy.clear(std::memory_order_release);
+    return c->ascending;
 }
 
 } // namespace
 
 template <class T>
 T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const {
-    const ::base::AttribMap* curve = curveMap(*this, curveIndex);
-    if (!curve)
-        return T{};
-    const CurveEntries e = curveEntries(*curve);
+    const MemoGuard guard(*m_memo);
+    Memo::Curve* memo = guard ? m_memo->find(curveIndex) : nullptr;
+    if (memo) {
+        __builtin_prefetch(memo->nearTimes);
+        __builtin_prefetch(memo->nearValues);
+        __builtin_prefetch(memo->entries.times);
+        __builtin_prefetch(memo->entries.values);
+        __builtin_prefetch(memo->map);
+    }
+    Resolved r;
+    if (memo && memo->live(curveIndex)) {
+        r = memo->entries;
+    } else {
+        const ::base::AttribMap* curve = curveMap(*this, curveIndex);
+        if (!curve)
+            return T{};
+        r = resolve(curveEntries(*curve));
+        if (guard) {
+            memo = &m_memo->at(curveIndex);
+            resolveCurve(*memo, *this, curveIndex, r);
+        }
+    }
 
     Curve<T> c;
-    scalarOf(e.pre, c.pre);
-    scalarOf(e.post, c.post);
-    scalarOf(e.tension, c.tension);
-    scalarOf(e.tightness, c.tightness);
-    if (!scalarOf(e.interpolation, c.mode))
-        if (const auto* perKey = arrayOf<std::uint8_t>(e.interpolation)) {
-            c.modes = perKey->data();
-            c.modeCount = perKey->size();
-        }
+    if (r.pre)
+        c.pre = *r.pre;
+    if (r.post)
+        c.post = *r.post;
+    if (r.tension)
+        c.tension = *r.tension;
+    if (r.tightness)
+        c.tightness = *r.tightness;
+    if (r.mode) {
+        c.mode = *r.mode;
+    } else if (r.modes) {
+        c.modes = r.modes->data();
+        c.modeCount = r.modes->size();
+    }
 
-    if (e.values && e.values->typeName() != ::base::TypeTraits<T>::n_array_name) {
+    const bool typed = r.valuesType == ::base::TypeTraits<T>::n_array_name;
+    if (r.values && !typed) {
         channelLog(::base::logError, "keyframeChannel |{}| Incompatible 'values' type!", *this);
         return T{};
     }
-    const auto* values = arrayOf<T>(e.values);
+    const auto* values = static_cast<const ::base::ArrayOf<T>*>(r.values);
     if (!values || values->empty()) {
         channelLog(::base::logError, "keyframeChannel |{}| Empty 'values' attribute detected!",
                    *this);
@@ -228,7 +401,7 @@ T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const 
     }
     if (values->size() == 1)
         return (*values)[0];
-    const auto* times = arrayOf<TimeCode>(e.times);
+    const auto* times = r.times;
     if (!times || times->empty()) {
         channelLog(::base::logError, "keyframeChannel |{}| Empty 'times' attribute detected!",
                    *this);
@@ -244,7 +417,7 @@ T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const 
     c.n = values->size();
 
     if (c.usesBezier()) {
-        const auto* tangents = arrayOf<float>(e.tangents);
+        const auto* tangents = r.tangents;
         if (!tangents || tangents->size() != 2 * c.n) {
             channelLog(::base::logWarning,
                        "keyframeChannel |{}| Missing or wrong tangents provided for the Bezier "
@@ -253,30 +426,25 @@ T IKeyframeChannel::computeValue(std::uint32_t curveIndex, TimeCode time) const 
             c.bezierFallback = true;
         } else {
             c.tangents = tangents->data();
-            if (const auto* weights = arrayOf<float>(e.weights)) {
-                if (weights->size() == tangents->size())
-                    c.weights = weights->data();
-                else
-                    channelLog(::base::logWarning,
-                               "keyframeChannel |{}| Invalid tangent weights provided for the "
-                               "Bezier curve! The curve will not work properly!",
-                               *this);
-            } else if (e.weights) {
+            if (r.weights && r.weights->size() == tangents->size())
+                c.weights = r.weights->data();
+            else if (r.weightsPresent)
                 channelLog(::base::logWarning,
                            "keyframeChannel |{}| Invalid tangent weights provided for the Bezier "
                            "curve! The curve will not work properly!",
                            *this);
-            }
         }
     }
 
-    std::uint32_t hint = 0;
-    if (!timesAscending(*m_memo, *this, curveIndex, c.times, c.n, hint))
+    if (!timesAscending(memo, *this, c.times, c.n))
         return T{};
-    c.hint = hint;
+    c.hint = memo ? memo->hint : 0;
     T result = evaluateCurve(c, time);
-    if (c.hint != hint)
-        storeHint(*m_memo, curveIndex, c.hint);
+    if (memo) {
+        memo->hint = c.hint;
+        memo->nearTimes = c.times + c.hint;
+        memo->nearValues = c.values + c.hint;
+    }
     return result;
 }
 
@@ -334,11 +502,9 @@ bool IKeyframeChannel::setKey(std::uint32_t curveIndex, TimeCode time, const T& 
                 }
             }
     }
-    if (!m_memo->busy.test_and_set(std::memory_order_acquire)) {
-        if (curveIndex < m_memo->curves.size())
-            m_memo->curves[curveIndex] = {};
-        m_memo->busy.clear(std::memory_order_release);
-    }
+    if (const MemoGuard guard(*m_memo); guard)
+        if (Memo::Curve* memo = m_memo->find(curveIndex))
+            memo->reset();
     return true;
 }
 

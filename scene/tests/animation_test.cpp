@@ -11,6 +11,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <functional>
 #include <limits>
 #include <string>
 #include <vector>
@@ -392,6 +393,122 @@ TEST_F(Channel, SetKeyKeepsTheCurveOrdered) {
     EXPECT_FALSE(channel->setKey(0, secs(3), 1.0)); // the curve holds floats
     EXPECT_FALSE(channel->setKey(4, secs(3), 1.0f));
     EXPECT_EQ(logged("Wrong number of components in the curve!"), 2u);
+}
+
+// Playback keeps what it found about a curve between evaluations; every kind
+// of change to the curve list, a curve map or its arrays must be seen by the
+// next evaluation (and, under the sanitizers, never read freed storage).
+TEST_F(Channel, EvaluationFollowsEveryChangeToTheCurves) {
+    using base::vec3f;
+    auto map = [&](std::vector<double> times, std::vector<float> values) {
+        auto* m = new base::AttribMap(channel->attribFactory());
+        for (double t : times)
+            m->appendAttributeItem(names::times, secs(t));
+        for (float v : values)
+            m->appendAttributeItem(names::values, vec3f{v, v, v});
+        return m;
+    };
+    auto curves = [&] { return channel->arrayAttribute(names::curves); };
+    struct Row {
+        const char* what;
+        std::function<void(base::AttribMap&)> change;
+        double time;
+        double expected;
+    };
+    base::AttribMap inherited(channel->attribFactory());
+    const Row rows[] = {
+        {"times replaced",
+         [&](base::AttribMap& c) {
+             c.removeAttribute(names::times);
+             c.appendAttributeItem(names::times, secs(0));
+             c.appendAttributeItem(names::times, secs(2));
+         },
+         0.5, 2.5},
+        {"times storage moved",
+         [&](base::AttribMap& c) {
+             auto& t = c.vecAttribute<TimeCode>(names::times)->items();
+             t.shrink_to_fit();
+             t.assign({secs(0), secs(4)});
+         },
+         1, 2.5},
+        {"values replaced",
+         [&](base::AttribMap& c) {
+             c.removeAttribute(names::values);
+             c.appendAttributeItem(names::values, vec3f{0, 0, 0});
+             c.appendAttributeItem(names::values, vec3f{20, 20, 20});
+         },
+         0.5, 10},
+        {"values of another type",
+         [&](base::AttribMap& c) {
+             c.removeAttribute(names::values);
+             c.appendAttributeItem(names::values, 1.0);
+             c.appendAttributeItem(names::values, 2.0);
+         },
+         0.5, 0},
+        {"key appended",
+         [&](base::AttribMap&) {
+             channel->setKey(0, secs(2), vec3f{30, 30, 30});
+         },
+         1.5, 20},
+        {"entry added, then changed in place",
+         [&](base::AttribMap& c) {
+             c.setAttribute(names::postExtrapolation, std::uint8_t(0));
+             EXPECT_TRUE(allEqual(at<vec3f>(2), 10));
+             c.setAttribute(names::postExtrapolation, std::uint8_t(1));
+         },
+         2, 20},
+        {"unrelated entry swapped for an interpolation",
+         [&](base::AttribMap& c) {
+             c.removeAttribute(names::name);
+             c.setAttribute(names::interpolation, std::uint8_t(0));
+         },
+         0.5, 0},
+        {"curve given a base",
+         [&](base::AttribMap& c) {
+             inherited.setAttribute(names::postExtrapolation, std::uint8_t(1));
+             c.setBase(&inherited);
+         },
+         3, 30},
+        {"curve list replaced",
+         [&](base::AttribMap&) {
+             channel->removeAttribute(names::curves);
+             curves()->append(map({0, 1}, {100, 200}));
+         },
+         0.5, 150},
+        {"curve replaced in its slot",
+         [&](base::AttribMap&) {
+             curves()->setItem(0, map({0, 1}, {-10, -20}));
+         },
+         0.5, -15},
+        {"curve inserted before",
+         [&](base::AttribMap&) {
+             curves()->insertItem(0, map({0, 1}, {1, 3}));
+         },
+         0.5, 2},
+        {"curve destroyed, the next moves up", [&](base::AttribMap&) { curves()->removeItem(0); },
+         0.25, 5},
+        {"every curve destroyed",
+         [&](base::AttribMap&) {
+             curves()->removeItem(0);
+             curves()->removeItem(0);
+         },
+         0.5, 0},
+    };
+    for (const Row& r : rows) {
+        log.clear();
+        channel->removeAttribute(names::curves);
+        base::AttribMap& c = keys<vec3f>({0, 1}, {vec3f{0, 0, 0}, vec3f{10, 10, 10}});
+        c.setAttribute(names::name, base::string("curve"));
+        curves()->append(map({0, 1}, {5, 5})); // curve 1 is remembered apart
+        EXPECT_TRUE(allEqual(at<vec3f>(0.5), 5)) << r.what;
+        EXPECT_TRUE(allEqual(channel->computeValue<vec3f>(1, secs(0.5)), 5)) << r.what;
+        r.change(c);
+        EXPECT_TRUE(allEqual(at<vec3f>(r.time), r.expected)) << r.what;
+        EXPECT_TRUE(allEqual(at<vec3f>(r.time), r.expected)) << r.what << " (again)";
+        EXPECT_EQ(logged("Incompatible 'values' type!"),
+                  std::string(r.what) == "values of another type" ? 2u : 0u)
+            << r.what;
+    }
 }
 
 // A layer whose one action plays a clip with a translation channel, linked
