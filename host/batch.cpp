@@ -304,8 +304,11 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             const ChildEnd& end = it->child->end();
             ImportRecord& record = records[it->index];
             judge(end, record);
+            // A child that died may have left half a file.
             if (!thumbnails.empty())
-                pictures[it->index] = takeThumbnail(thumbnailOf(it->index));
+                if (base::vector<std::uint8_t> png = takeThumbnail(thumbnailOf(it->index));
+                    end.kind == ChildEnd::exited)
+                    pictures[it->index] = std::move(png);
             // The partial document of a child that died.
             if (end.kind != ChildEnd::exited && !inputs[it->index].output.empty())
                 ::unlink(temporaryPath(inputs[it->index].output, end.pid).c_str());
