@@ -3,6 +3,7 @@
 #include "archive_input.h"
 #include "b_format.h"
 #include "batch_report.h"
+#include "html_report.h"
 #include "module_loader.h"
 #include "output_file.h"
 #include "scene_importer.h"
@@ -14,6 +15,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 #include <filesystem>
 #include <memory>
@@ -58,6 +60,18 @@ base::string prepareFolder(const base::string& folder) {
     ::close(fd);
     ::unlink(probe.c_str());
     return {};
+}
+
+// A private folder below $TMPDIR (or /tmp); empty with 'error' when none can be made.
+base::string temporaryFolder(base::string& error) {
+    const char* tmp = std::getenv("TMPDIR");
+    base::string folder =
+        base::format("{}/scene-import-XXXXXX", tmp && *tmp ? base::string(tmp) : "/tmp");
+    if (!::mkdtemp(folder.data())) {
+        error = base::format("cannot create a temporary folder: {}", std::strerror(errno));
+        return {};
+    }
+    return folder;
 }
 
 void silenceOutput() {
@@ -116,6 +130,9 @@ BatchSwitches registerBatchSwitches(base::CmdLineOptions& options) {
         "-j", "--jobs", "Run this many imports at once in a batch (default: the number of cores).");
     s.report = options.addValue<base::string>(
         "--report", {}, "Write the batch's per-file records as JSON to this file.");
+    s.reportHtml = options.addValue<base::string>(
+        "--report-html", {},
+        "Write one HTML page showing every file of the batch (thumbnail, status, counts).");
     return s;
 }
 
@@ -182,6 +199,7 @@ base::vector<base::string> assignOutputs(base::vector<BatchInput>& inputs,
 }
 
 int runBatch(const BatchSettings& settings, const BatchImport& import) {
+    base::string error;
     auto fail = [](const base::string& message) {
         std::fprintf(stderr, "scene-import: %s\n", message.c_str());
         return 1;
@@ -189,14 +207,27 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
     if (!settings.outputFolder.empty())
         if (const base::string problem = prepareFolder(settings.outputFolder); !problem.empty())
             return fail(problem);
-    if (!settings.report.empty())
-        if (const base::string problem = outputProblem(settings.report); !problem.empty())
-            return fail(problem);
+    for (const base::string* report : {&settings.report, &settings.reportHtml})
+        if (!report->empty())
+            if (const base::string problem = outputProblem(*report); !problem.empty())
+                return fail(problem);
+    // The children leave their thumbnails here; removed when the batch ends.
+    base::string thumbnails;
+    if (!settings.reportHtml.empty()) {
+        thumbnails = temporaryFolder(error);
+        if (thumbnails.empty())
+            return fail(error);
+    }
+    const std::unique_ptr<const base::string, void (*)(const base::string*)> removeThumbnails(
+        &thumbnails, [](const base::string* folder) {
+            std::error_code ignored;
+            if (!folder->empty())
+                fs::remove_all(fs::path(folder->c_str()), ignored);
+        });
 
     base::vector<BatchInput> inputs;
     for (const base::string& model : settings.models)
         inputs.push_back({model, base::string(fs::path(model.c_str()).filename().string()), {}});
-    base::string error;
     if (!settings.folder.empty()) {
         base::string extensions;
         if (!importerExtensions(settings.modulePath, extensions, error) ||
@@ -213,6 +244,10 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
     const auto started = std::chrono::steady_clock::now();
     base::vector<ImportRecord> records(inputs.size());
     base::vector<base::string> names(inputs.size());
+    base::vector<base::vector<std::uint8_t>> pictures(inputs.size());
+    auto thumbnailOf = [&](std::size_t i) {
+        return thumbnails.empty() ? base::string() : base::format("{}/{}.png", thumbnails, i);
+    };
     BatchProgress progress(stderr, BatchProgress::modeFor(settings.quiet), inputs.size());
 
     struct Running {
@@ -240,7 +275,7 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             progress.finished(input.name, record);
             return;
         }
-        const ImportSettings one{input.model, input.output, settings.modulePath};
+        const ImportSettings one{input.model, input.output, settings.modulePath, thumbnailOf(i)};
         const ChildJob job = [&, one](int recordFd) {
             if (!settings.childMessages)
                 silenceOutput();
@@ -269,6 +304,11 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             const ChildEnd& end = it->child->end();
             ImportRecord& record = records[it->index];
             judge(end, record);
+            // A child that died may have left half a file.
+            if (!thumbnails.empty())
+                if (base::vector<std::uint8_t> png = takeThumbnail(thumbnailOf(it->index));
+                    end.kind == ChildEnd::exited)
+                    pictures[it->index] = std::move(png);
             // The partial document of a child that died.
             if (end.kind != ChildEnd::exited && !inputs[it->index].output.empty())
                 ::unlink(temporaryPath(inputs[it->index].output, end.pid).c_str());
@@ -287,16 +327,19 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
     std::fwrite(table.data(), 1, table.size(), stdout);
     std::fflush(stdout);
     int code = std::all_of(records.begin(), records.end(), imported) ? 0 : 1;
-    if (!settings.report.empty()) {
-        const base::string json = reportJson(records, seconds);
+    auto write = [&](const base::string& path, const base::string& text) {
         if (!writeAtomically(
-                settings.report,
+                path,
                 [&](base::Stream& stream) {
-                    return stream.write(json.data(), json.size()) == json.size();
+                    return stream.write(text.data(), text.size()) == text.size();
                 },
                 error))
             code = fail(error);
-    }
+    };
+    if (!settings.report.empty())
+        write(settings.report, reportJson(records, seconds));
+    if (!settings.reportHtml.empty())
+        write(settings.reportHtml, reportHtml(records, names, pictures, seconds));
     return code;
 }
 

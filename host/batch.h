@@ -3,7 +3,8 @@
 // The inputs are the models named on the command line and every model file
 // below the --batch folder; each becomes OUTDIR/<relative path>.json. At the
 // end a table of the records goes to standard output and, with --report, the
-// records as JSON to a file.
+// records as JSON to a file and, with --report-html, a page of
+// thumbnails.
 #pragma once
 
 #include "b_cmdline.h"
@@ -21,6 +22,7 @@ struct BatchSwitches {
     base::CmdLineValue<base::string>* folder = nullptr;
     base::CmdLineValue<std::int64_t>* jobs = nullptr;
     base::CmdLineValue<base::string>* report = nullptr;
+    base::CmdLineValue<base::string>* reportHtml = nullptr;
 };
 
 BatchSwitches registerBatchSwitches(base::CmdLineOptions& options);
@@ -57,6 +59,8 @@ struct BatchSettings {
     // Empty: the batch only summarises.
     base::string outputFolder;
     base::string report;
+    // The HTML page; each child then also renders a thumbnail.
+    base::string reportHtml;
     base::string modulePath;
     unsigned jobs = 1;
     IsolationLimits limits;

@@ -39,6 +39,15 @@ bool imported(const ImportRecord& record) noexcept {
     return record.status == "imported";
 }
 
+base::vector<std::size_t> failuresFirst(std::span<const ImportRecord> records) {
+    base::vector<std::size_t> order(records.size());
+    std::iota(order.begin(), order.end(), std::size_t(0));
+    std::stable_sort(order.begin(), order.end(), [&](std::size_t a, std::size_t b) {
+        return !imported(records[a]) && imported(records[b]);
+    });
+    return order;
+}
+
 BatchProgress::BatchProgress(std::FILE* to, Mode mode, std::size_t total)
     : m_to(to), m_mode(mode), m_total(total), m_started(std::chrono::steady_clock::now()) {}
 
@@ -102,11 +111,7 @@ void BatchProgress::clear() {
 
 base::string formatTable(std::span<const ImportRecord> records, std::span<const base::string> names,
                          double seconds) {
-    base::vector<std::size_t> order(records.size());
-    std::iota(order.begin(), order.end(), std::size_t(0));
-    std::stable_sort(order.begin(), order.end(), [&](std::size_t a, std::size_t b) {
-        return !imported(records[a]) && imported(records[b]);
-    });
+    const base::vector<std::size_t> order = failuresFirst(records);
     std::size_t fileWidth = 4, statusWidth = 6;
     for (std::size_t i = 0; i < records.size(); ++i) {
         fileWidth = std::max(fileWidth, names[i].size());

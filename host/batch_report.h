@@ -14,6 +14,9 @@ namespace host {
 // Whether a record counts as a success of the batch.
 bool imported(const ImportRecord& record) noexcept;
 
+// The indices of 'records', failures first, each group in input order.
+base::vector<std::size_t> failuresFirst(std::span<const ImportRecord> records);
+
 // On a terminal one line redrawn in place (done/total, failures, elapsed,
 // time left, the file being read), cleared at the end; elsewhere one plain
 // line per finished file.

@@ -15,6 +15,7 @@
 #include "batch.h"
 #include "host_log.h"
 #include "host_options.h"
+#include "html_report.h"
 #include "isolation.h"
 #include "listing.h"
 #include "module_loader.h"
@@ -217,6 +218,10 @@ int runBatch(const host::HostSwitches& switches, const FeatureSwitches& more,
         settings.report = batch.report->value();
     if (settings.report.empty() && batch.report->isSet())
         return usageError("--report needs a file name");
+    if (batch.reportHtml->isSet())
+        settings.reportHtml = batch.reportHtml->value();
+    if (settings.reportHtml.empty() && batch.reportHtml->isSet())
+        return usageError("--report-html needs a file name");
     settings.modulePath =
         switches.plugin->isSet() ? switches.plugin->value() : host::ModuleLoader::defaultPath();
     settings.jobs = batch.jobs->isSet() ? unsigned(batch.jobs->value()) : host::defaultJobs();
@@ -224,12 +229,16 @@ int runBatch(const host::HostSwitches& switches, const FeatureSwitches& more,
     settings.quiet = host::isOn(switches.quiet);
     settings.childMessages = switches.verbose->isSet();
     const FeatureRequests requests;
-    return host::runBatch(settings,
-                          [&](const host::ImportSettings& one, host::ImportRecord& record) {
-                              const base::vector<host::SceneFeature> features =
-                                  sceneFeatures(switches, more, requests, one.output, false);
-                              return host::importScene(one, options, hostLog, features, record);
-                          });
+    return host::runBatch(
+        settings, [&](const host::ImportSettings& one, host::ImportRecord& record) {
+            base::vector<host::SceneFeature> features =
+                sceneFeatures(switches, more, requests, one.output, false);
+            if (!one.thumbnail.empty())
+                features.emplace_back([&one](host::ImportedScene& scene) {
+                    return host::thumbnailFeature(scene.factory, one.model, one.thumbnail);
+                });
+            return host::importScene(one, options, hostLog, features, record);
+        });
 }
 
 int run(int argc, char** argv, host::HostLog& hostLog) {
@@ -273,8 +282,10 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
     }
     // A report lists the files of a batch; with one model and -o FILE the
     // document's path would be taken for a folder.
-    if (batch.report->isSet())
-        return usageError("--report needs a batch: several models, --batch DIR or -o OUTDIR/");
+    for (const auto* report : {batch.report, batch.reportHtml})
+        if (report->isSet())
+            return usageError(base::format(
+                "{} needs a batch: several models, --batch DIR or -o OUTDIR/", report->name()));
     if (positional.empty())
         return usageError("no model given");
 

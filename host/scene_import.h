@@ -43,6 +43,8 @@ struct ImportSettings {
     // relative to the document.
     base::string output;
     base::string modulePath;
+    // Where a batch wants the scene's thumbnail PNG; empty for none.
+    base::string thumbnail;
 };
 
 // Imports 'settings.model' and runs 'features' on the result; fills 'record'
