@@ -8,6 +8,7 @@
 
 #include "b_cmdline.h"
 #include "b_memory.h"
+#include "batch_shard.h"
 #include "host_log.h"
 #include "import_record.h"
 #include "isolation.h"
@@ -21,6 +22,11 @@ struct BatchSwitches {
     base::CmdLineValue<base::string>* folder = nullptr;
     base::CmdLineValue<std::int64_t>* jobs = nullptr;
     base::CmdLineValue<base::string>* report = nullptr;
+    base::CmdLineValue<base::string>* shard = nullptr;
+    base::CmdLineValue<bool>* shardFromEnv = nullptr;
+    base::CmdLineValue<std::int64_t>* shardCount = nullptr;
+    base::CmdLineValue<bool>* skipExisting = nullptr;
+    base::CmdLineValue<base::string>* mergeReports = nullptr;
 };
 
 BatchSwitches registerBatchSwitches(base::CmdLineOptions& options);
@@ -63,7 +69,14 @@ struct BatchSettings {
     // Progress off (-q); the children's own messages shown (-v).
     bool quiet = false;
     bool childMessages = false;
+    Shard shard;
+    // Leave an input whose document is newer than it (status "skipped").
+    bool skipExisting = false;
 };
+
+// Reads --shard, --shard-from-env, --shard-count and --skip-existing into
+// 'settings'. False with a message for the user when they do not fit.
+bool readShardSwitches(const BatchSwitches& switches, BatchSettings& settings, base::string& error);
 
 // -j's default: the number of cores.
 unsigned defaultJobs();

@@ -21,6 +21,7 @@
 #include "output_file.h"
 #include "preview_switches.h"
 #include "read_back.h"
+#include "report_merge.h"
 #include "scene_cmdline.h"
 #include "scene_features.h"
 #include "scene_import.h"
@@ -223,6 +224,8 @@ int runBatch(const host::HostSwitches& switches, const FeatureSwitches& more,
     settings.limits = isolationLimits(switches);
     settings.quiet = host::isOn(switches.quiet);
     settings.childMessages = switches.verbose->isSet();
+    if (base::string error; !host::readShardSwitches(batch, settings, error))
+        return usageError(error);
     const FeatureRequests requests;
     return host::runBatch(settings,
                           [&](const host::ImportSettings& one, host::ImportRecord& record) {
@@ -264,6 +267,8 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
         return host::readBack(read->value(), output, summary, hostLog);
     }
+    if (batch.mergeReports->isSet())
+        return host::mergeReportFiles(batch.mergeReports->value(), positional);
     if (host::wantsBatch(batch, positional.size(),
                          switches.output->isSet() ? switches.output->values().front()
                                                   : base::string())) {
