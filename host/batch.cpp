@@ -166,6 +166,18 @@ bool readShardSwitches(const BatchSwitches& switches, BatchSettings& settings,
     return true;
 }
 
+const char* batchOnlySwitch(const BatchSwitches& switches) noexcept {
+    for (const base::CmdLineOption* option :
+         {static_cast<const base::CmdLineOption*>(switches.report),
+          static_cast<const base::CmdLineOption*>(switches.shard),
+          static_cast<const base::CmdLineOption*>(switches.shardFromEnv),
+          static_cast<const base::CmdLineOption*>(switches.shardCount),
+          static_cast<const base::CmdLineOption*>(switches.skipExisting)})
+        if (option->isSet())
+            return option->name().c_str();
+    return nullptr;
+}
+
 bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::string& output) {
     return switches.folder->isSet() || models > 1 || (!output.empty() && output.back() == '/');
 }

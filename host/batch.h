@@ -78,6 +78,10 @@ struct BatchSettings {
 // 'settings'. False with a message for the user when they do not fit.
 bool readShardSwitches(const BatchSwitches& switches, BatchSettings& settings, base::string& error);
 
+// The name of a switch given that only a batch takes (null when none is),
+// so that a single import does not silently ignore it.
+const char* batchOnlySwitch(const BatchSwitches& switches) noexcept;
+
 // -j's default: the number of cores.
 unsigned defaultJobs();
 

@@ -278,8 +278,9 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
     }
     // A report lists the files of a batch; with one model and -o FILE the
     // document's path would be taken for a folder.
-    if (batch.report->isSet())
-        return usageError("--report needs a batch: several models, --batch DIR or -o OUTDIR/");
+    if (const char* only = host::batchOnlySwitch(batch))
+        return usageError(
+            base::format("{} needs a batch: several models, --batch DIR or -o OUTDIR/", only));
     if (positional.empty())
         return usageError("no model given");
 

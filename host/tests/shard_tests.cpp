@@ -297,6 +297,9 @@ TEST_F(BatchFiles, BadShardSwitchesAreUsageErrors) {
     std::string err;
     EXPECT_EQ(hostExit("--shard-from-env --shard-count 4 " + folder, err), 2) << err;
     EXPECT_NE(err.find("neither"), std::string::npos) << err;
+    // One model: a shard of it means nothing, and is not silently ignored.
+    EXPECT_EQ(hostExit("--shard 1/2 '" SCENE_SAMPLES_DIR "/sample.gltf'", err), 2) << err;
+    EXPECT_NE(err.find("--shard needs a batch"), std::string::npos) << err;
 }
 
 } // namespace
