@@ -133,7 +133,66 @@ BatchSwitches registerBatchSwitches(base::CmdLineOptions& options) {
     s.reportHtml = options.addValue<base::string>(
         "--report-html", {},
         "Write one HTML page showing every file of the batch (thumbnail, status, counts).");
+    s.shard = options.addValue<base::string>(
+        "--shard", {},
+        "Convert only shard K of N (K/N) of the batch's models, chosen by a hash of each "
+        "model's path below the batch folder.");
+    s.shardFromEnv = options.addValue<bool>(
+        "--shard-from-env", {},
+        "Take the shard from a Slurm array (SLURM_ARRAY_TASK_ID, _MIN, _MAX, _COUNT) or an "
+        "indexed job (JOB_COMPLETION_INDEX with --shard-count).",
+        0, 1);
+    s.shardCount = options.addValue<std::int64_t>("--shard-count", {},
+                                                  "The number of shards for --shard-from-env.");
+    s.skipExisting = options.addValue<bool>(
+        "--skip-existing", {},
+        "Leave each model whose output document exists and is newer than the model.", 0, 1);
+    s.mergeReports = options.addValue<base::string>(
+        "--merge-reports", {},
+        "Combine the --report documents given as arguments (one per shard) into this file.");
     return s;
+}
+
+bool readShardSwitches(const BatchSwitches& switches, BatchSettings& settings,
+                       base::string& error) {
+    const bool fromEnv = switches.shardFromEnv->isSet() && switches.shardFromEnv->value();
+    if (fromEnv && switches.shard->isSet()) {
+        error = "--shard and --shard-from-env exclude each other";
+        return false;
+    }
+    std::uint32_t count = 0;
+    if (switches.shardCount->isSet()) {
+        const std::int64_t n = switches.shardCount->value();
+        if (n < 1 || n > std::int64_t(UINT32_MAX) || !fromEnv) {
+            error = fromEnv ? base::format("--shard-count wants a whole number above 0, not {}", n)
+                            : base::string("--shard-count goes with --shard-from-env");
+            return false;
+        }
+        count = std::uint32_t(n);
+    }
+    if (switches.shard->isSet() && !parseShard(switches.shard->value(), settings.shard, error))
+        return false;
+    if (fromEnv && !shardFromEnvironment(&std::getenv, count, settings.shard, error))
+        return false;
+    settings.skipExisting = switches.skipExisting->isSet() && switches.skipExisting->value();
+    if (settings.skipExisting && settings.outputFolder.empty()) {
+        error = "--skip-existing needs -o OUTDIR/";
+        return false;
+    }
+    return true;
+}
+
+const char* batchOnlySwitch(const BatchSwitches& switches) noexcept {
+    for (const base::CmdLineOption* option :
+         {static_cast<const base::CmdLineOption*>(switches.report),
+          static_cast<const base::CmdLineOption*>(switches.reportHtml),
+          static_cast<const base::CmdLineOption*>(switches.shard),
+          static_cast<const base::CmdLineOption*>(switches.shardFromEnv),
+          static_cast<const base::CmdLineOption*>(switches.shardCount),
+          static_cast<const base::CmdLineOption*>(switches.skipExisting)})
+        if (option->isSet())
+            return option->name().c_str();
+    return nullptr;
 }
 
 bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::string& output) {
@@ -240,6 +299,12 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
         for (const base::string& note : assignOutputs(inputs, settings.outputFolder))
             if (!settings.quiet)
                 std::fprintf(stderr, "scene-import: %s\n", note.c_str());
+    // After the outputs are named, so that a collision's "-2" does not
+    // depend on which shard runs.
+    if (settings.shard.count > 1)
+        std::erase_if(inputs, [&](const BatchInput& input) {
+            return shardOf(input.name, settings.shard.count) != settings.shard.index;
+        });
 
     const auto started = std::chrono::steady_clock::now();
     base::vector<ImportRecord> records(inputs.size());
@@ -270,6 +335,12 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
                 failure)
                 problem = base::format("cannot create the folder of '{}': {}", input.output,
                                        failure.message());
+        if (problem.empty() && settings.skipExisting && upToDate(input.model, input.output)) {
+            record.status = "skipped";
+            record.output = input.output;
+            progress.finished(input.name, record);
+            return;
+        }
         if (!problem.empty()) {
             record.reason = std::move(problem);
             progress.finished(input.name, record);
@@ -337,7 +408,7 @@ int runBatch(const BatchSettings& settings, const BatchImport& import) {
             code = fail(error);
     };
     if (!settings.report.empty())
-        write(settings.report, reportJson(records, seconds));
+        write(settings.report, reportJson(records, seconds, settings.shard));
     if (!settings.reportHtml.empty())
         write(settings.reportHtml, reportHtml(records, names, pictures, seconds));
     return code;

@@ -9,6 +9,7 @@
 
 #include "b_cmdline.h"
 #include "b_memory.h"
+#include "batch_shard.h"
 #include "host_log.h"
 #include "import_record.h"
 #include "isolation.h"
@@ -23,6 +24,11 @@ struct BatchSwitches {
     base::CmdLineValue<std::int64_t>* jobs = nullptr;
     base::CmdLineValue<base::string>* report = nullptr;
     base::CmdLineValue<base::string>* reportHtml = nullptr;
+    base::CmdLineValue<base::string>* shard = nullptr;
+    base::CmdLineValue<bool>* shardFromEnv = nullptr;
+    base::CmdLineValue<std::int64_t>* shardCount = nullptr;
+    base::CmdLineValue<bool>* skipExisting = nullptr;
+    base::CmdLineValue<base::string>* mergeReports = nullptr;
 };
 
 BatchSwitches registerBatchSwitches(base::CmdLineOptions& options);
@@ -67,7 +73,18 @@ struct BatchSettings {
     // Progress off (-q); the children's own messages shown (-v).
     bool quiet = false;
     bool childMessages = false;
+    Shard shard;
+    // Leave an input whose document is newer than it (status "skipped").
+    bool skipExisting = false;
 };
+
+// Reads --shard, --shard-from-env, --shard-count and --skip-existing into
+// 'settings'. False with a message for the user when they do not fit.
+bool readShardSwitches(const BatchSwitches& switches, BatchSettings& settings, base::string& error);
+
+// The name of a switch given that only a batch takes (null when none is),
+// so that a single import does not silently ignore it.
+const char* batchOnlySwitch(const BatchSwitches& switches) noexcept;
 
 // -j's default: the number of cores.
 unsigned defaultJobs();

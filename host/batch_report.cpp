@@ -36,7 +36,7 @@ const base::string& note(const ImportRecord& record) {
 } // namespace
 
 bool imported(const ImportRecord& record) noexcept {
-    return record.status == "imported";
+    return record.status == "imported" || record.status == "skipped";
 }
 
 base::vector<std::size_t> failuresFirst(std::span<const ImportRecord> records) {
@@ -130,12 +130,18 @@ base::string formatTable(std::span<const ImportRecord> records, std::span<const 
             base::format("{2,*0}  {3,*1}  {4,9}  {5,10}  {6,10}  {7,8:f2}  {8}\n", fw, sw, names[i],
                          r.status, r.objects(), r.vertices, r.faces, r.seconds, note(r));
     }
-    out += base::format("{} files: {} imported, {} failed, {:f1} s\n", records.size(),
-                        records.size() - failed, failed, seconds);
+    const auto skipped =
+        std::size_t(std::count_if(records.begin(), records.end(),
+                                  [](const ImportRecord& r) { return r.status == "skipped"; }));
+    out +=
+        base::format("{} files: {} imported, ", records.size(), records.size() - failed - skipped);
+    if (skipped)
+        out += base::format("{} skipped, ", skipped);
+    out += base::format("{} failed, {:f1} s\n", failed, seconds);
     return out;
 }
 
-base::string reportJson(std::span<const ImportRecord> records, double seconds) {
+base::string reportJson(std::span<const ImportRecord> records, double seconds, const Shard& shard) {
     rapidjson::StringBuffer buffer;
     rapidjson::PrettyWriter<rapidjson::StringBuffer> json(buffer);
     json.SetIndent(' ', 2);
@@ -143,16 +149,27 @@ base::string reportJson(std::span<const ImportRecord> records, double seconds) {
         json.Key(key);
         json.String(value.data(), rapidjson::SizeType(value.size()));
     };
-    std::size_t failed = 0;
-    for (const ImportRecord& r : records)
+    std::size_t failed = 0, skipped = 0;
+    for (const ImportRecord& r : records) {
         failed += imported(r) ? 0 : 1;
+        skipped += r.status == "skipped" ? 1 : 0;
+    }
     json.StartObject();
     json.Key("files");
     json.Uint64(records.size());
     json.Key("imported");
-    json.Uint64(records.size() - failed);
+    json.Uint64(records.size() - failed - skipped);
+    json.Key("skipped");
+    json.Uint64(skipped);
     json.Key("failed");
     json.Uint64(failed);
+    json.Key("shard");
+    json.StartObject();
+    json.Key("index");
+    json.Uint(shard.index);
+    json.Key("count");
+    json.Uint(shard.count);
+    json.EndObject();
     json.Key("seconds");
     json.Double(seconds);
     json.Key("records");

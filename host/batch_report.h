@@ -3,6 +3,7 @@
 #pragma once
 
 #include "b_memory.h"
+#include "batch_shard.h"
 #include "import_record.h"
 
 #include <chrono>
@@ -11,7 +12,8 @@
 
 namespace host {
 
-// Whether a record counts as a success of the batch.
+// Whether a record counts as a success of the batch: imported, or skipped
+// because its document was up to date.
 bool imported(const ImportRecord& record) noexcept;
 
 // The indices of 'records', failures first, each group in input order.
@@ -51,7 +53,9 @@ private:
 base::string formatTable(std::span<const ImportRecord> records, std::span<const base::string> names,
                          double seconds);
 
-// The records as a JSON document, in input order.
-base::string reportJson(std::span<const ImportRecord> records, double seconds);
+// The records as a JSON document, in input order, with the shard they are
+// (so that merging the shards' reports can tell which are missing).
+base::string reportJson(std::span<const ImportRecord> records, double seconds,
+                        const Shard& shard = {});
 
 } // namespace host

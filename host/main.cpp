@@ -22,6 +22,7 @@
 #include "output_file.h"
 #include "preview_switches.h"
 #include "read_back.h"
+#include "report_merge.h"
 #include "scene_cmdline.h"
 #include "scene_features.h"
 #include "scene_import.h"
@@ -228,6 +229,8 @@ int runBatch(const host::HostSwitches& switches, const FeatureSwitches& more,
     settings.limits = isolationLimits(switches);
     settings.quiet = host::isOn(switches.quiet);
     settings.childMessages = switches.verbose->isSet();
+    if (base::string error; !host::readShardSwitches(batch, settings, error))
+        return usageError(error);
     const FeatureRequests requests;
     return host::runBatch(
         settings, [&](const host::ImportSettings& one, host::ImportRecord& record) {
@@ -273,6 +276,8 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
         return host::readBack(read->value(), output, summary, hostLog);
     }
+    if (batch.mergeReports->isSet())
+        return host::mergeReportFiles(batch.mergeReports->value(), positional);
     if (host::wantsBatch(batch, positional.size(),
                          switches.output->isSet() ? switches.output->values().front()
                                                   : base::string())) {
@@ -282,10 +287,9 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
     }
     // A report lists the files of a batch; with one model and -o FILE the
     // document's path would be taken for a folder.
-    for (const auto* report : {batch.report, batch.reportHtml})
-        if (report->isSet())
-            return usageError(base::format(
-                "{} needs a batch: several models, --batch DIR or -o OUTDIR/", report->name()));
+    if (const char* only = host::batchOnlySwitch(batch))
+        return usageError(
+            base::format("{} needs a batch: several models, --batch DIR or -o OUTDIR/", only));
     if (positional.empty())
         return usageError("no model given");
 

@@ -6,7 +6,7 @@ set -euo pipefail
 packages=(cmake g++ make libassimp-dev assimp-utils assimp-testmodels rapidjson-dev
           libpugixml-dev googletest libgtest-dev libbenchmark-dev pkgconf python3
           libpng-dev libzip-dev zlib1g-dev liblz4-dev liblzma-dev libzstd-dev
-          chromium)
+          chromium parallel)
 
 missing=()
 for p in "${packages[@]}"; do
