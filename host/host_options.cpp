@@ -121,6 +121,11 @@ HostSwitches registerHostSwitches(base::CmdLineOptions& options) {
         "--max-memory", {},
         "Limit the address space of the import process to this many MiB; a file that needs more "
         "fails to import.");
+    s.jsonLayout = options.addValue<base::string>(
+        "--json-layout", {},
+        "How scene documents are written: 'keyed' (the default: one member per object, keyed "
+        "by its type, so keys repeat) or 'list' (an array of {\"type\", \"attributes\"} "
+        "objects, strict JSON for general JSON tools). --read takes both.");
     scene::register_importer_options(options);
     scene::register_scene_options(options);
     s.flipTextureCoordinates = options.addValue<bool>(
@@ -139,6 +144,13 @@ bool parseCommandLine(base::CmdLineOptions& options, int argc, const char* const
         if (const base::CmdLineOption* option = options.find(range.option);
             option && option->isSet() && !checkRange(*option, range, error))
             return false;
+    if (const base::CmdLineOption* layout = options.find("--json-layout");
+        layout && layout->isSet())
+        for (const base::string& text : layout->texts())
+            if (text != "keyed" && text != "list") {
+                error = layout->invalidValueMessage(text, "keyed or list");
+                return false;
+            }
     if (positional.size() > 1)
         for (int i = 1; i + 1 < argc; ++i) {
             const std::string_view arg = argv[i], next = argv[i + 1];
@@ -156,6 +168,12 @@ bool parseCommandLine(base::CmdLineOptions& options, int argc, const char* const
 
 bool isOn(const base::CmdLineValue<bool>* option) noexcept {
     return option && option->isSet() && option->value();
+}
+
+base::JSONLayout jsonLayout(const HostSwitches& switches) noexcept {
+    const auto* option = switches.jsonLayout;
+    return option && option->isSet() && option->value() == "list" ? base::JSONLayout::list
+                                                                  : base::JSONLayout::keyed;
 }
 
 } // namespace host

@@ -5,6 +5,7 @@
 #pragma once
 
 #include "b_cmdline.h"
+#include "b_json.h"
 #include "b_memory.h"
 
 #include <cstdint>
@@ -24,6 +25,7 @@ struct HostSwitches {
     base::CmdLineValue<std::int64_t>* timeout = nullptr;
     base::CmdLineValue<bool>* noIsolation = nullptr;
     base::CmdLineValue<std::int64_t>* maxMemory = nullptr;
+    base::CmdLineValue<base::string>* jsonLayout = nullptr;
 };
 
 // Adds the host's switches and the importer and scene options to 'options'.
@@ -36,5 +38,8 @@ bool parseCommandLine(base::CmdLineOptions& options, int argc, const char* const
 
 // Whether a bool switch was given and not switched off ("--validate false").
 bool isOn(const base::CmdLineValue<bool>* option) noexcept;
+
+// The layout --json-layout asks for (checked by parseCommandLine).
+base::JSONLayout jsonLayout(const HostSwitches& switches) noexcept;
 
 } // namespace host

@@ -112,7 +112,9 @@ base::vector<host::SceneFeature> sceneFeatures(const host::HostSwitches& switche
         features.emplace_back(host::validateMeshes);
     if (!output.empty())
         features.emplace_back(
-            [output](host::ImportedScene& scene) { return host::writeDocument(scene, output); });
+            [output, layout = host::jsonLayout(switches)](host::ImportedScene& scene) {
+                return host::writeDocument(scene, output, layout);
+            });
     if (!requests.preview.path.empty())
         features.emplace_back([preview = requests.preview](host::ImportedScene& scene) {
             return host::preview::previewFeature(scene.factory, preview);
@@ -274,7 +276,7 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         if (!output.empty() && output != "-" && host::sameFile(read->value(), output))
             return usageError(base::format("the output '{}' is the document itself", output));
         const bool summary = switches.summary->isSet() ? switches.summary->value() : output.empty();
-        return host::readBack(read->value(), output, summary, hostLog);
+        return host::readBack(read->value(), output, summary, hostLog, host::jsonLayout(switches));
     }
     if (batch.mergeReports->isSet())
         return host::mergeReportFiles(batch.mergeReports->value(), positional);

@@ -7,14 +7,14 @@
 #include "scene_stats.h"
 #include "stream/b_fs.h"
 
-
 #include <chrono>
 #include <cstdio>
 #include <filesystem>
 
 namespace host {
 
-int readBack(const base::string& document, const base::string& output, bool summary, HostLog& log) {
+int readBack(const base::string& document, const base::string& output, bool summary, HostLog& log,
+             base::JSONLayout layout) {
     const auto started = std::chrono::steady_clock::now();
     // Named like an import's factory: after the folder of the document.
     std::error_code ignored;
@@ -52,7 +52,10 @@ int readBack(const base::string& document, const base::string& output, bool summ
     base::string error;
     if (!output.empty())
         writeOutput(
-            output, [&](base::Stream& stream) { return base::writeFactory(*factory, stream); },
+            output,
+            [&](base::Stream& stream) {
+                return base::writeFactory(*factory, stream, 120, nullptr, layout);
+            },
             error);
     if (!error.empty()) {
         std::fprintf(stderr, "scene-import: %s\n", error.c_str());

@@ -4,15 +4,17 @@
 // which is how the document is shown to be lossless.
 #pragma once
 
+#include "b_json.h"
 #include "b_memory.h"
 #include "host_log.h"
 
 namespace host {
 
-// Reads 'document' and writes it to 'output' ("-" standard output, empty for
-// none); prints the summary when asked. Problems of the document are logged
-// with their lines; what can be read is read and written. Exit 0 when it read
-// without problems and was written, 1 otherwise.
-int readBack(const base::string& document, const base::string& output, bool summary, HostLog& log);
+// Reads 'document' (either layout) and writes it to 'output' ("-" standard
+// output, empty for none) in 'layout'; prints the summary when asked. Problems of the document are
+// logged with their lines; what can be read is read and written. Exit 0 when it read without
+// problems and was written, 1 otherwise.
+int readBack(const base::string& document, const base::string& output, bool summary, HostLog& log,
+             base::JSONLayout layout = base::JSONLayout::keyed);
 
 } // namespace host

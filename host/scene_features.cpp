@@ -59,10 +59,13 @@ private:
 
 } // namespace
 
-int writeDocument(ImportedScene& scene, const base::string& output) {
+int writeDocument(ImportedScene& scene, const base::string& output, base::JSONLayout layout) {
     base::string error;
     if (writeOutput(
-            output, [&](base::Stream& stream) { return base::writeFactory(scene.factory, stream); },
+            output,
+            [&](base::Stream& stream) {
+                return base::writeFactory(scene.factory, stream, 120, nullptr, layout);
+            },
             error)) {
         if (output != "-")
             scene.record.output = output;

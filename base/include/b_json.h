@@ -32,6 +32,18 @@
 // Factories: writeFactory writes one object with a member per object of the
 // instance table, in id order, keyed by the object's type name; readFactory
 // creates the objects in document order and restores their references.
+//
+// The list layout (JSONLayout::list) is for general JSON tools, which keep only
+// the last of repeated keys and refuse NaN: no key repeats and the text is
+// strict JSON. The factory is an array of {"type": T, "attributes": {...}} in
+// the same order; an AttribArray is an array of {"type": T, "value": V}; NaN and
+// infinities are the strings "NaN", "Infinity" and "-Infinity"; a byte that is
+// not part of valid UTF-8 (Latin-1 texts of old files) is written as \u00XX of
+// its value. A reader told the layout takes those strings as numbers and
+// \u0080 to \u00FF as single bytes, so the bytes read back unchanged; a text
+// that a tool re-escaped that way (\u00e9 for e-acute) therefore reads back as
+// a Latin-1 byte. readFactory tells the layouts apart by the first token ('{'
+// or '['); AttribArray reads both forms in either layout.
 #pragma once
 
 #include "b_data_io.h"
@@ -45,6 +57,8 @@
 namespace base {
 
 class PluginFactory;
+
+enum class JSONLayout : std::uint8_t { keyed, list };
 
 // A syntax error in a JSON document. Message: "json parser {stream}({offset})|
 // {text}" where offset counts the bytes before the error.
@@ -141,6 +155,9 @@ public:
 
     // Whether every byte so far reached the stream (or its buffer).
     bool good() const noexcept;
+    // Set before the first value.
+    void setLayout(JSONLayout layout) noexcept;
+    JSONLayout layout() const noexcept;
 
 private:
     struct Impl;
@@ -177,6 +194,9 @@ public:
     bool atEnd();
     // Whether an object comes next (nothing is consumed).
     bool objectFollows();
+    // The list layout's spellings of non-finite numbers and raw bytes.
+    void setLayout(JSONLayout layout) noexcept;
+    JSONLayout layout() const noexcept;
 
 private:
     struct Impl;
@@ -189,12 +209,12 @@ private:
 // strict for the duration (short writes throw base::exception) and gets its
 // flags back afterwards. Answers whether the whole document was written.
 bool writeFactory(PluginFactory& factory, Stream& stream, std::uint32_t maxWidth = 120,
-                  IProgress* progress = nullptr);
+                  IProgress* progress = nullptr, JSONLayout layout = JSONLayout::keyed);
 
-// Creates an object per member of the document (unknown types as placeholders)
-// and reads it; references by name may point forward. Problems are logged: a
-// syntax error ends the reading, and everything read until then is kept (with
-// its references restored). Answers whether the document read without problems.
+// Either layout. Creates an object per member (or item) of the document (unknown types as
+// placeholders) and reads it; references by name may point forward. Problems are logged: a syntax
+// error ends the reading, and everything read until then is kept (with its references restored).
+// Answers whether the document read without problems.
 bool readFactory(PluginFactory& factory, Stream& stream);
 
 } // namespace base

@@ -416,6 +416,20 @@ bool AttribArray::write(DataWriter& w, std::uint32_t index) const {
         const Attribute* one = item(index);
         return one && one->write(w);
     }
+    // Items are keyed by their type, so keys repeat; the list layout has none.
+    const auto* json = dynamic_cast<const JSONAttrWriter*>(&w);
+    if (json && json->layout() == JSONLayout::list) {
+        if (!w.beginArray(0))
+            return false;
+        for (const Attribute* one : m_items) {
+            if (!one || one->hasFlag(flagTransient))
+                continue;
+            if (!w.beginObject() || !w.key("type") || !w.writeString(one->typeName().view()) ||
+                !w.key("value") || !one->write(w) || !w.endObject())
+                return false;
+        }
+        return w.endArray();
+    }
     if (!w.beginObject())
         return false;
     for (const Attribute* one : m_items) {
@@ -432,24 +446,20 @@ bool AttribArray::read(DataReader& r, std::uint32_t index) {
         Attribute* one = item(index);
         return one && one->read(r);
     }
-    if (!r.beginObject())
+    const bool listed = r.beginArray();
+    if (!listed && !r.beginObject())
         return false;
     const name_id owner = className();
     vector<Owned> read;
-    for (;;) {
-        if (r.endObject())
-            break;
-        const std::uint32_t line = r.line();
-        std::string_view key;
-        if (!r.key(key))
-            return logMissingKey(r, line);
+    // One item's value, next in the reader.
+    const auto readItem = [&](std::string_view key, std::uint32_t line) {
         const auto position = std::uint32_t(read.size());
         KeyCache::Resolved resolved;
         std::string_view nameText, typeText;
         if (!keyCache().resolve(m_factory, key, false, resolved, nameText, typeText)) {
             logUnknownType(r, owner, format("{}", position), key, line);
             r.skipValue();
-            continue;
+            return;
         }
         const name_id type = resolved.type;
         const std::uint32_t depth = r.depth();
@@ -457,9 +467,37 @@ bool AttribArray::read(DataReader& r, std::uint32_t index) {
         if (!value || !value->read(r)) {
             logUnreadable(r, owner, format("{}", position), type.view(), line);
             r.skipRest(depth);
-            continue;
+            return;
         }
         read.push_back(std::move(value));
+    };
+    for (;;) {
+        if (listed ? r.endArray() : r.endObject())
+            break;
+        const std::uint32_t line = r.line();
+        std::string_view key;
+        if (!listed) {
+            if (!r.key(key))
+                return logMissingKey(r, line);
+            readItem(key, line);
+            continue;
+        }
+        // {"type": T, "value": V}
+        const std::uint32_t depth = r.depth();
+        string type;
+        if (!r.beginObject()) {
+            logUnreadable(r, owner, format("{}", read.size()), type, line);
+            r.skipValue();
+            continue;
+        }
+        if (!r.key(key) || key != "type" || !r.readString(type) || !r.key(key) || key != "value") {
+            logUnreadable(r, owner, format("{}", read.size()), type, line);
+            r.skipRest(depth);
+            continue;
+        }
+        readItem(type, line);
+        if (!r.endObject())
+            return logMissingKey(r, r.line());
     }
     clear();
     for (Owned& one : read)
@@ -701,7 +739,7 @@ std::uint32_t PluginReaderResolveStringId::settle(std::uint32_t id) {
 // ---- Factories ------------------------------------------------------------------------
 
 bool writeFactory(PluginFactory& factory, Stream& stream, std::uint32_t maxWidth,
-                  IProgress* progress) {
+                  IProgress* progress, JSONLayout layout) {
     struct FlagsGuard {
         Stream& stream;
         std::uint32_t flags;
@@ -711,6 +749,8 @@ bool writeFactory(PluginFactory& factory, Stream& stream, std::uint32_t maxWidth
 
     PluginWriterResolveStringId resolver(factory);
     JSONAttrWriter writer(stream, maxWidth, &resolver);
+    writer.setLayout(layout);
+    const bool listed = layout == JSONLayout::list;
     const std::uint32_t count = factory.pluginCount();
     int reported = -1;
     const auto report = [&](std::uint64_t done) {
@@ -720,14 +760,20 @@ bool writeFactory(PluginFactory& factory, Stream& stream, std::uint32_t maxWidth
         reported = percent;
     };
     report(0);
-    bool ok = writer.beginObject();
+    bool ok = listed ? writer.beginArray(0) : writer.beginObject();
     for (std::uint32_t id = 0; ok && id < count; ++id) {
         const ref<IPlugin> plugin = factory.plugin(id);
-        if (plugin && !plugin->hasFlag(Attribute::flagTransient))
-            ok = writer.key(plugin->className().view()) && plugin->write(writer);
+        if (plugin && !plugin->hasFlag(Attribute::flagTransient)) {
+            const std::string_view type = plugin->className().view();
+            if (listed)
+                ok = writer.beginObject() && writer.key("type") && writer.writeString(type) &&
+                     writer.key("attributes") && plugin->write(writer) && writer.endObject();
+            else
+                ok = writer.key(type) && plugin->write(writer);
+        }
         report(id + 1);
     }
-    return ok && writer.endObject() && writer.good();
+    return ok && (listed ? writer.endArray() : writer.endObject()) && writer.good();
 }
 
 namespace {
@@ -796,43 +842,73 @@ bool readFactory(PluginFactory& factory, Stream& stream) {
                          text);
             ok = false;
         };
+        // One object of the type, its attributes next in the reader.
+        const auto readObject = [&](std::string_view type, std::uint32_t line) {
+            // Objects come in runs of one type: intern each run once, before
+            // the next call on the reader ends the key. Only an object makes an
+            // object: nothing is created for a member that could not be read
+            // into one.
+            const bool named = usableName(type);
+            if (named && type != lastType.view())
+                lastType = name_id(type);
+            ref<IPlugin> plugin;
+            if (named && reader.objectFollows())
+                plugin = factory.create(lastType, PluginFactory::createReportUnknown |
+                                                      PluginFactory::createLocked);
+            const std::uint32_t depth = reader.depth();
+            if (!plugin) {
+                complain("Error reading plugin!", line);
+                reader.skipValue();
+                return;
+            }
+            objects.push_back(plugin);
+            if (!plugin->read(reader)) {
+                complain("Error reading plugin!", line);
+                reader.skipRest(depth);
+            }
+            resolver.learn(*plugin);
+        };
         try {
-            if (!reader.beginObject()) {
+            const bool listed = reader.beginArray();
+            if (listed)
+                reader.setLayout(JSONLayout::list);
+            if (!listed && !reader.beginObject()) {
                 complain("Missing object opening bracket!", reader.line());
             } else {
                 for (;;) {
-                    if (reader.endObject())
+                    if (listed ? reader.endArray() : reader.endObject())
                         break;
                     const std::uint32_t line = reader.line();
-                    std::string_view type;
-                    if (!reader.key(type)) {
-                        complain("Missing closing bracket or extra comma before the bracket!",
-                                 line);
-                        break;
+                    std::string_view key;
+                    if (!listed) {
+                        if (!reader.key(key)) {
+                            complain("Missing closing bracket or extra comma before the bracket!",
+                                     line);
+                            break;
+                        }
+                        readObject(key, line);
+                        continue;
                     }
-                    // Objects come in runs of one type: intern each run once,
-                    // before the next call on the reader ends the key. Only an
-                    // object makes an object: nothing is created for a member
-                    // that could not be read into one.
-                    const bool named = usableName(type);
-                    if (named && type != lastType.view())
-                        lastType = name_id(type);
-                    ref<IPlugin> plugin;
-                    if (named && reader.objectFollows())
-                        plugin = factory.create(lastType, PluginFactory::createReportUnknown |
-                                                              PluginFactory::createLocked);
+                    // {"type": T, "attributes": {...}}
                     const std::uint32_t depth = reader.depth();
-                    if (!plugin) {
+                    string type;
+                    if (!reader.beginObject()) {
                         complain("Error reading plugin!", line);
                         reader.skipValue();
                         continue;
                     }
-                    objects.push_back(plugin);
-                    if (!plugin->read(reader)) {
+                    if (!reader.key(key) || key != "type" || !reader.readString(type) ||
+                        !reader.key(key) || key != "attributes") {
                         complain("Error reading plugin!", line);
                         reader.skipRest(depth);
+                        continue;
                     }
-                    resolver.learn(*plugin);
+                    readObject(type, line);
+                    if (!reader.endObject()) {
+                        complain("Missing closing bracket or extra comma before the bracket!",
+                                 reader.line());
+                        break;
+                    }
                 }
             }
         } catch (const JSONException& e) {

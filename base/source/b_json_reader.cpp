@@ -268,7 +268,11 @@ struct JSONAttrReader::Impl {
             } else if (cp >= 0xDC00 && cp <= 0xDFFF) {
                 fail(rapidjson::kParseErrorStringUnicodeSurrogateInvalid);
             }
-            appendUtf8(text, cp);
+            // The list layout's spelling of a byte outside valid UTF-8.
+            if (list && cp >= 0x80 && cp <= 0xFF)
+                text += char(cp);
+            else
+                appendUtf8(text, cp);
             return;
         }
         default:
@@ -536,6 +540,19 @@ struct JSONAttrReader::Impl {
 
     template <class N>
     bool number(N& value) {
+        if constexpr (std::is_floating_point_v<N>) {
+            if (list && next() == Token::string) {
+                using limits = std::numeric_limits<N>;
+                if (text == "NaN")
+                    value = limits::quiet_NaN();
+                else if (text == "Infinity" || text == "-Infinity")
+                    value = text[0] == '-' ? -limits::infinity() : limits::infinity();
+                else
+                    return false;
+                consume();
+                return true;
+            }
+        }
         if (next() != Token::number)
             return false;
         const char* first = text.data();
@@ -577,6 +594,7 @@ struct JSONAttrReader::Impl {
     std::uint32_t tokenLine = 1;
     std::uint32_t depth = 0;
     bool afterKey = false;
+    bool list = false;
 };
 
 JSONAttrReader::JSONAttrReader(Stream& stream, DataReaderResolveStringId* resolver)
@@ -679,6 +697,13 @@ bool JSONAttrReader::atEnd() {
 
 bool JSONAttrReader::objectFollows() {
     return m_impl->next() == Token::beginObject;
+}
+
+void JSONAttrReader::setLayout(JSONLayout layout) noexcept {
+    m_impl->list = layout == JSONLayout::list;
+}
+JSONLayout JSONAttrReader::layout() const noexcept {
+    return m_impl->list ? JSONLayout::list : JSONLayout::keyed;
 }
 
 } // namespace base

@@ -27,6 +27,39 @@ DataWriterResolveStringId& defaultWriterResolver() {
     return resolver;
 }
 
+// Length of the valid UTF-8 sequence at 'p' (overlong forms, surrogates and
+// code points beyond U+10FFFF are invalid, as strict decoders hold), 0 if none.
+std::size_t utf8Sequence(const unsigned char* p, std::size_t left) {
+    const unsigned c = p[0];
+    std::size_t n;
+    unsigned low = 0x80, high = 0xBF;
+    if (c < 0x80)
+        return 1;
+    if (c >= 0xC2 && c <= 0xDF) {
+        n = 2;
+    } else if (c >= 0xE0 && c <= 0xEF) {
+        n = 3;
+        if (c == 0xE0)
+            low = 0xA0;
+        else if (c == 0xED)
+            high = 0x9F;
+    } else if (c >= 0xF0 && c <= 0xF4) {
+        n = 4;
+        if (c == 0xF0)
+            low = 0x90;
+        else if (c == 0xF4)
+            high = 0x8F;
+    } else {
+        return 0;
+    }
+    if (left < n || p[1] < low || p[1] > high)
+        return 0;
+    for (std::size_t i = 2; i < n; ++i)
+        if (p[i] < 0x80 || p[i] > 0xBF)
+            return 0;
+    return n;
+}
+
 } // namespace
 
 namespace json_detail {
@@ -180,15 +213,61 @@ struct JSONAttrWriter::Impl
     // Texts without characters to escape (nearly all names) are copied in one
     // go; the others take rapidjson's escaping.
     void quoted(std::string_view text) {
+        bool high = false;
         for (const char c : text) {
             const auto u = static_cast<unsigned char>(c);
+            high |= u >= 0x80;
             if (u < 0x20 || c == '"' || c == '\\') {
+                if (strict)
+                    return strictQuoted(text);
                 WriteString(text.data(), rapidjson::SizeType(text.size()));
                 return;
             }
         }
+        if (high && strict)
+            return strictQuoted(text);
         out.Put('"');
         out.write(text.data(), text.size());
+        out.Put('"');
+    }
+
+    // Escapes what strict parsers refuse: control characters and bytes outside
+    // valid UTF-8 (as \u00XX of the byte, which the reader turns back into it).
+    void strictQuoted(std::string_view text) {
+        static constexpr char hex[] = "0123456789abcdef";
+        const auto* p = reinterpret_cast<const unsigned char*>(text.data());
+        const auto* last = p + text.size();
+        out.Put('"');
+        while (p != last) {
+            const unsigned c = *p;
+            const std::size_t n = utf8Sequence(p, std::size_t(last - p));
+            if (n > 1 || (n == 1 && c >= 0x20 && c != '"' && c != '\\')) {
+                out.write(reinterpret_cast<const char*>(p), n);
+                p += n;
+                continue;
+            }
+            ++p;
+            out.Put('\\');
+            switch (c) {
+            case '"':
+            case '\\':
+                out.Put(char(c));
+                break;
+            case '\n':
+                out.Put('n');
+                break;
+            case '\t':
+                out.Put('t');
+                break;
+            case '\r':
+                out.Put('r');
+                break;
+            default:
+                out.write("u00", 3);
+                out.Put(hex[c >> 4]);
+                out.Put(hex[c & 15]);
+            }
+        }
         out.Put('"');
     }
 
@@ -225,11 +304,14 @@ struct JSONAttrWriter::Impl
     template <class N>
     bool number(N value) {
         if constexpr (std::is_floating_point_v<N>) {
-            // JSON has no spelling for these; rapidjson's extension does.
-            if (std::isnan(value))
-                return literal("NaN");
-            if (std::isinf(value))
-                return literal(value < 0 ? "-Infinity" : "Infinity");
+            // JSON has no spelling for these; rapidjson's extension does, and
+            // strict documents carry them as strings.
+            if (!std::isfinite(value)) {
+                const std::string_view text = std::isnan(value) ? "NaN"
+                                              : value < 0       ? "-Infinity"
+                                                                : "Infinity";
+                return strict ? string(text) : literal(text);
+            }
         }
         if (!beforeValue())
             return false;
@@ -258,6 +340,7 @@ struct JSONAttrWriter::Impl
     std::uint32_t maxWidth;
     bool keyPending = false;
     bool rootDone = false;
+    bool strict = false;
 };
 
 JSONAttrWriter::JSONAttrWriter(Stream& stream, std::uint32_t maxWidth,
@@ -281,6 +364,13 @@ bool JSONAttrWriter::beginArray(std::uint32_t hint) {
 bool JSONAttrWriter::endArray() {
     return m_impl->close(true);
 }
+void JSONAttrWriter::setLayout(JSONLayout layout) noexcept {
+    m_impl->strict = layout == JSONLayout::list;
+}
+JSONLayout JSONAttrWriter::layout() const noexcept {
+    return m_impl->strict ? JSONLayout::list : JSONLayout::keyed;
+}
+
 bool JSONAttrWriter::key(std::string_view text) {
     return m_impl->key(text);
 }

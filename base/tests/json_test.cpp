@@ -8,6 +8,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <cstring>
@@ -132,9 +133,10 @@ ref<IPlugin> makeNode(PluginFactory& factory, const char* type, const char* name
     return plugin;
 }
 
-string writeAll(PluginFactory& factory, std::uint32_t width = 120, IProgress* progress = nullptr) {
+string writeAll(PluginFactory& factory, std::uint32_t width = 120, IProgress* progress = nullptr,
+                JSONLayout layout = JSONLayout::keyed) {
     Stream stream = memoryStream();
-    EXPECT_TRUE(writeFactory(factory, stream, width, progress));
+    EXPECT_TRUE(writeFactory(factory, stream, width, progress, layout));
     return textOf(stream);
 }
 
@@ -881,7 +883,7 @@ TEST(JsonFactory, ReadingKeepsWhatWasReadBeforeAnError) {
          "{\"node\": {\"name^string\": \"a\"},\n\"node\": {\"ref^plugin\": \"a\"},\n\"node\": "
          "{\"x^int\": }}",
          3, "json parser memory(78)| Invalid value."},
-        {"NotAnObject", "[]", 0, "json parser memory(1)| Missing object opening bracket!"},
+        {"NotAnObject", "5", 0, "json parser memory(1)| Missing object opening bracket!"},
         {"MemberNotAnObject", "{\"node\": 5, \"node\": {}}", 1,
          "json parser memory(1)| Error reading plugin!"},
         {"ForwardNameNeverDefined", "{\"node\": {\"ref^plugin\": \"nobody\"}}", 1,
@@ -907,6 +909,132 @@ TEST(JsonFactory, ReadingKeepsWhatWasReadBeforeAnError) {
     readFactory(*factory, stream);
     EXPECT_EQ(factory->plugin(1)->findAttribute<ref<IPlugin>>(name_id("ref"))->get(),
               factory->plugin(0).get());
+}
+
+// Walks one value, failing on a key that repeats within its object or on a
+// non-finite number outside a string.
+void expectUniqueKeys(JSONAttrReader& r, const string& where) {
+    if (r.beginObject()) {
+        vector<string> keys;
+        std::string_view key;
+        while (!r.endObject()) {
+            ASSERT_TRUE(r.key(key));
+            const string name(key);
+            EXPECT_EQ(std::count(keys.begin(), keys.end(), name), 0) << where << "/" << name;
+            keys.push_back(name);
+            expectUniqueKeys(r, where + "/" + name);
+        }
+    } else if (r.beginArray()) {
+        while (!r.endArray())
+            expectUniqueKeys(r, where + "[]");
+    } else {
+        string text;
+        double number = 0;
+        if (!r.readString(text) && r.readDouble(number)) {
+            EXPECT_TRUE(std::isfinite(number)) << where;
+        } else if (text.empty()) {
+            r.skipValue();
+        }
+    }
+}
+
+TEST(JsonFactory, ListLayoutRepeatsNoKeyAndReadsBackExactly) {
+    ref<PluginFactory> factory = richFactory();
+    ref<IPlugin> child = factory->plugin(2);
+    child->setAttribute(name_id("nan"), std::numeric_limits<float>::quiet_NaN());
+    child->setAttribute(name_id("low"), -std::numeric_limits<double>::infinity());
+    child->setAttribute(name_id("high"), std::numeric_limits<float>::infinity());
+    // Latin-1 bytes of an old file, valid UTF-8, a byte cut from a sequence.
+    const string latin = "caf\xe9 \xff / \xc3\xa9 / \xe2\x82 / \"q\"\t";
+    child->setAttribute(name_id("latin"), latin);
+    AttribArray* points = child->arrayAttribute(name_id("points"));
+    points->append(new TypedAttribute<vec3d>(vec3d(1, 2, 3)));
+    points->append(new TypedAttribute<vec3d>(vec3d(4, 5, 6)));
+    points->append(new TypedAttribute<float>(std::numeric_limits<float>::quiet_NaN()));
+
+    const string keyed = writeAll(*factory, 50);
+    const string list = writeAll(*factory, 50, nullptr, JSONLayout::list);
+    ASSERT_EQ(list.front(), '[');
+    EXPECT_NE(list.find("\"type\": \"node\""), string::npos);
+    EXPECT_NE(list.find("\"nan^float\": \"NaN\""), string::npos) << list;
+    EXPECT_NE(list.find("\"low^double\": \"-Infinity\""), string::npos);
+    EXPECT_NE(list.find("caf\\u00e9 \\u00ff / \xc3\xa9 / \\u00e2\\u0082 / \\\"q\\\"\\t"),
+              string::npos);
+    EXPECT_NE(keyed.find("\"nan^float\": NaN"), string::npos);
+    EXPECT_NE(keyed.find("\"points^array\": {"), string::npos);
+    {
+        Stream stream = streamOf(list);
+        JSONAttrReader reader(stream);
+        reader.setLayout(JSONLayout::list);
+        expectUniqueKeys(reader, "");
+        EXPECT_TRUE(reader.atEnd());
+    }
+
+    // Either layout reads into the same objects; each writes back as it was.
+    for (const string* document : {&keyed, &list}) {
+        ref<PluginFactory> copy = makeFactory();
+        CaptureLog log;
+        ScopedLog scoped(log);
+        Stream stream = streamOf(*document);
+        readFactory(*copy, stream);
+        EXPECT_EQ(writeAll(*copy, 50), keyed);
+        EXPECT_EQ(writeAll(*copy, 50, nullptr, JSONLayout::list), list);
+        ref<IPlugin> read = copy->plugin(2);
+        EXPECT_TRUE(std::isnan(*read->findAttribute<float>(name_id("nan"))));
+        EXPECT_EQ(*read->findAttribute<double>(name_id("low")),
+                  -std::numeric_limits<double>::infinity());
+        EXPECT_EQ(*read->findAttribute<string>(name_id("latin")), latin);
+    }
+}
+
+TEST(JsonFactory, ListLayoutReadingKeepsWhatWasRead) {
+    struct Row {
+        const char* name;
+        const char* document;
+        std::uint32_t objects;
+        const char* message;
+    };
+    const Row rows[] = {
+        {"ItemNotAnObject", "[5, {\"type\": \"node\", \"attributes\": {}}]", 1,
+         "json parser memory(1)| Error reading plugin!"},
+        {"AttributesBeforeType", "[{\"attributes\": {}, \"type\": \"node\"}, {\"type\": \"mesh\", "
+         "\"attributes\": {}}]", 1, "json parser memory(1)| Error reading plugin!"},
+        {"ExtraMember", "[{\"type\": \"node\", \"attributes\": {}, \"x\": 1}]", 1,
+         "json parser memory(1)| Missing closing bracket or extra comma before the bracket!"},
+        // A bare NaN is still a number to the reader, and the strings only
+        // stand for numbers where a number is read.
+        {"Values", "[{\"type\": \"node\", \"attributes\": {\"a^float\": NaN, \"b^string\": "
+         "\"NaN\", \"c^double\": \"Infinity\"}}]", 1, nullptr},
+    };
+    for (const Row& row : rows) {
+        SCOPED_TRACE(row.name);
+        ref<PluginFactory> factory = makeFactory();
+        CaptureLog log;
+        ScopedLog scoped(log);
+        Stream stream = streamOf(row.document);
+        EXPECT_EQ(readFactory(*factory, stream), row.message == nullptr);
+        EXPECT_EQ(factory->pluginCount(), row.objects);
+        EXPECT_EQ(log.messages(), row.message ? vector<string>{row.message} : vector<string>{});
+    }
+    ref<PluginFactory> factory = makeFactory();
+    Stream stream = streamOf(rows[3].document);
+    ASSERT_TRUE(readFactory(*factory, stream));
+    ref<IPlugin> node = factory->plugin(0);
+    EXPECT_TRUE(std::isnan(*node->findAttribute<float>(name_id("a"))));
+    EXPECT_EQ(*node->findAttribute<string>(name_id("b")), "NaN");
+    EXPECT_EQ(*node->findAttribute<double>(name_id("c")), std::numeric_limits<double>::infinity());
+
+    // Array items that are not {"type", "value"} objects are dropped, the rest kept.
+    ref<PluginFactory> arrays = makeFactory();
+    CaptureLog log;
+    ScopedLog scoped(log);
+    Stream items = streamOf("[{\"type\": \"node\", \"attributes\": {\"p^array\": [7, {\"value\": "
+                            "1, \"type\": \"int\"}, {\"type\": \"int\", \"value\": 2}]}}]");
+    readFactory(*arrays, items);
+    const AttribArray* p = arrays->plugin(0)->findArray(name_id("p"));
+    ASSERT_NE(p, nullptr);
+    ASSERT_EQ(p->size(), 1u);
+    EXPECT_EQ(log.messages().size(), 2u);
 }
 
 } // namespace

@@ -548,6 +548,66 @@ TEST_F(HostTest, ReadBackWritesTheSameDocument) {
     EXPECT_EQ(summaryLines(summary.out)["node"], 11);
 }
 
+// The list layout is what a general JSON tool reads whole: Python's json
+// module, refusing NaN tokens, keeps every key. Each list entry stands for one
+// key of the default document ("type" plus "attributes" or "value").
+TEST_F(HostTest, ListLayoutKeepsEveryKeyForPythonAndReadsBack) {
+    ASSERT_EQ(run({"{sample}", "-o", "{tmp}/keyed.json"}).code, 0);
+    const HostRun listed = run({"{sample}", "--json-layout", "list", "-o", "{tmp}/list.json"});
+    ASSERT_EQ(listed.code, 0) << listed.err;
+    std::ofstream(m_dir / "count.py") << R"(import json, sys
+def count(path, strict):
+    seen = {'pairs': 0, 'lost': 0, 'attributes': 0, 'value': 0}
+    def hook(pairs):
+        seen['pairs'] += len(pairs)
+        seen['lost'] += len(pairs) - len(dict(pairs))
+        for k, _ in pairs:
+            if k in ('attributes', 'value'):
+                seen[k] += 1
+        return dict(pairs)
+    def refuse(token):
+        raise ValueError(token)
+    with open(path, encoding='utf-8') as f:
+        json.load(f, object_pairs_hook=hook, parse_constant=refuse if strict else None)
+    return seen
+k = count(sys.argv[1], False)
+l = count(sys.argv[2], True)
+print(k['pairs'], l['lost'], l['pairs'] - l['attributes'] - l['value'], l['attributes'])
+)";
+    std::string out;
+    FILE* pipe = popen(("python3 '" + (m_dir / "count.py").string() + "' '" +
+                        (m_dir / "keyed.json").string() + "' '" + (m_dir / "list.json").string() +
+                        "'")
+                           .c_str(),
+                       "r");
+    ASSERT_NE(pipe, nullptr);
+    char buffer[256];
+    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
+        out.append(buffer, n);
+    ASSERT_EQ(pclose(pipe), 0) << out;
+    std::istringstream numbers(out);
+    long keyedPairs = -1, lost = -1, listPairs = -2, objects = 0;
+    numbers >> keyedPairs >> lost >> listPairs >> objects;
+    EXPECT_EQ(lost, 0);
+    EXPECT_EQ(listPairs, keyedPairs);
+    EXPECT_GT(objects, 10);
+
+    // Either layout reads back into either layout, byte for byte.
+    const std::string keyed = readFile(m_dir / "keyed.json"), list = readFile(m_dir / "list.json");
+    for (const char* from : {"keyed.json", "list.json"}) {
+        SCOPED_TRACE(from);
+        ASSERT_EQ(run({"--read", std::string("{tmp}/") + from, "-o", "{tmp}/a.json"}).code, 0);
+        const HostRun r = run({"--read", std::string("{tmp}/") + from, "--json-layout", "list",
+                               "-o", "{tmp}/b.json"});
+        ASSERT_EQ(r.code, 0) << r.err;
+        EXPECT_TRUE(readFile(m_dir / "a.json") == keyed);
+        EXPECT_TRUE(readFile(m_dir / "b.json") == list);
+    }
+    const HostRun bad = run({"{sample}", "--json-layout", "tree", "-o", "-"});
+    EXPECT_EQ(bad.code, 2);
+    EXPECT_NE(bad.err.find("keyed or list"), std::string::npos) << bad.err;
+}
+
 // Broken documents: a clear error with its line, exit 1, what can be read is
 // read and written.
 TEST_F(HostTest, ReadBackOfBrokenDocuments) {
