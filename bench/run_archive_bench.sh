@@ -9,22 +9,14 @@
 # to reuse build/bench-release.
 set -euo pipefail
 
-root=$(cd "$(dirname "$0")/.." && pwd)
-build="$root/build/bench-release"
 reps=${REPS:-5}
 count=${TRIANGLES:-1000000}
 
 for tool in gzip zstd; do
     command -v "$tool" >/dev/null || { echo "run_archive_bench: needs $tool" >&2; exit 1; }
 done
-if [[ "${SKIP_BUILD:-0}" != 1 ]]; then
-    cmake -S "$root" -B "$build" -DCMAKE_BUILD_TYPE=Release -DSCENE_BENCH=ON \
-        -DSCENE_SANITIZE=OFF -DSCENE_TESTS=OFF >/dev/null
-    cmake --build "$build" -j2 --target make_grid_model import_case scene_assimp >/dev/null
-fi
-generate="$build/bench/make_grid_model"
-run="$build/bench/import_case"
-models="$build/bench-models"
+# shellcheck source=bench_common.sh
+source "$(dirname "$0")/bench_common.sh"
 mkdir -p "$models/gz" "$models/zst"
 plain="$models/grid_$count.ply"
 [[ -s "$plain" ]] || "$generate" "$plain" "$count" >/dev/null
@@ -35,8 +27,6 @@ zst="$models/zst/grid_$count.ply.zst"
 [[ -s "$gz" ]] || gzip -6 -c "$plain" >"$gz"
 [[ -s "$zst" ]] || zstd -q -3 -c "$plain" >"$zst"
 
-median() { sort -g | awk '{ v[NR] = $1 } END { print (NR % 2) ? v[(NR + 1) / 2] : (v[NR / 2] + v[NR / 2 + 1]) / 2 }'; }
-field() { sed -n "s/.* $1=\([^ ]*\).*/\1/p"; }
 # CPU seconds (user+sys) of a command.
 cpu_of() { /usr/bin/time -f '%U %S' "$@" 2>&1 >/dev/null | tail -1 | awk '{ print $1 + $2 }'; }
 

@@ -22,15 +22,8 @@ trap 'rm -rf "$work"' EXIT
 # A crash of the reader must stay a signal under the sanitizers, as for users.
 export ASAN_OPTIONS="${ASAN_OPTIONS:+$ASAN_OPTIONS:}handle_segv=0:handle_sigbus=0:handle_sigfpe=0:handle_abort=0:detect_leaks=0"
 
-failures=0
-check() { # description, then a command that must succeed
-    local what=$1
-    shift
-    if "$@"; then echo "ok: $what"; else
-        echo "FAILED: $what"
-        failures=$((failures + 1))
-    fi
-}
+# shellcheck source=check.sh
+source "$(dirname "$(readlink -f "$0")")/check.sh"
 
 mkdir -p "$work/in/a" "$work/in/b"
 cp "$corpus/PLY/cube.ply" "$work/in/a/same.ply"
