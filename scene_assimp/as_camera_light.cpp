@@ -4,6 +4,7 @@
 // folds it into that node when the node is a leaf, and otherwise gives the
 // object a node of its own below it.
 #include "as_importer.h"
+#include "as_node.h"
 #include "b_format.h"
 #include "b_frame.h"
 #include "b_log.h"
@@ -81,20 +82,10 @@ base::string stem(const aiString& name, const char* fallback) {
 
 void AssimpImporter::indexSourceNodes(const aiScene* scene) {
     m_sourceNodes.clear();
-    // Pre-order, children in order: the first node of a name is the one
-    // assimp's own search answers and the one converted first.
-    base::vector<const aiNode*> pending{scene->mRootNode};
-    base::map<const aiNode*, bool> seen;
-    while (!pending.empty()) {
-        const aiNode* node = pending.back();
-        pending.pop_back();
-        if (!node || !seen.emplace(node, true).second)
-            continue;
-        if (node->mName.length)
-            m_sourceNodes.emplace(std::string_view(node->mName.C_Str(), node->mName.length), node);
-        for (unsigned i = node->mChildren ? node->mNumChildren : 0; i-- > 0;)
-            pending.push_back(node->mChildren[i]);
-    }
+    forEachSourceNode(scene->mRootNode, [this](const aiNode& node) {
+        if (node.mName.length)
+            m_sourceNodes.emplace(std::string_view(node.mName.C_Str(), node.mName.length), &node);
+    });
 }
 
 base::string AssimpImporter::freshName(const base::string& base) {

@@ -1,4 +1,5 @@
 #include "as_importer.h"
+#include "as_node.h"
 
 #include "as_io.h"
 #include "as_logger.h"
@@ -184,24 +185,15 @@ base::map<base::string, base::ref<scene::INode>> nodesByName(const base::PluginF
 // ---- AssimpImporter ---------------------------------------------------------------
 
 void AssimpImporter::addSourceNames(const aiNode* root, NodeMap& nodes) const {
-    // In conversion order (depth first, parents before children), so the
-    // first node of a name is the one a unique name would have kept.
-    // A node listing one of its ancestors is walked once.
-    base::vector<const aiNode*> pending{root};
-    base::map<const aiNode*, bool> seen;
-    while (!pending.empty()) {
-        const aiNode* node = pending.back();
-        pending.pop_back();
-        if (!node || !seen.emplace(node, true).second)
-            continue;
-        if (auto found = m_nodeMemo.find(node); found != m_nodeMemo.end()) {
-            base::string source(node->mName.C_Str(), node->mName.length);
+    // In conversion order, so the first node of a name is the one a unique
+    // name would have kept.
+    forEachSourceNode(root, [&](const aiNode& node) {
+        if (auto found = m_nodeMemo.find(&node); found != m_nodeMemo.end()) {
+            base::string source(node.mName.C_Str(), node.mName.length);
             if (found->second->name() != source)
                 nodes.emplace(std::move(source), base::ref<scene::INode>(found->second));
         }
-        for (unsigned i = node->mChildren ? node->mNumChildren : 0; i-- > 0;)
-            pending.push_back(node->mChildren[i]);
-    }
+    });
 }
 
 AssimpImporter::AssimpImporter(base::IPluginDesc* descriptor, base::PluginFactory* factory,
