@@ -1,6 +1,7 @@
 #include "batch.h"
 
 #include "archive_input.h"
+#include "b_exception.h"
 #include "b_format.h"
 #include "batch_report.h"
 #include "html_report.h"
@@ -199,6 +200,33 @@ bool wantsBatch(const BatchSwitches& switches, std::size_t models, const base::s
     return switches.folder->isSet() || models > 1 || (!output.empty() && output.back() == '/');
 }
 
+namespace {
+
+// An archive in a batch folder is a folder too: each model inside is an
+// input, named below the archive's name. One that cannot be listed stays an
+// input itself, so its failure gets a record.
+void addArchiveMembers(const base::string& archive, const base::string& name,
+                       std::string_view extensions, base::vector<BatchInput>& found) {
+    base::vector<base::string> members;
+    try {
+        if (base::fs::master().isFolder(archive))
+            members = base::fs::listFilesBelow(archive);
+        else
+            members.push_back(archive);
+    } catch (const base::exception&) {
+        members.assign(1, archive);
+    }
+    for (const base::string& member : members) {
+        if (member == archive) {
+            found.push_back({archive, name, {}});
+        } else if (base::fs::hasExtensionIn(base::fs::innerName(member), extensions)) {
+            found.push_back({member, name + member.substr(archive.size()), {}});
+        }
+    }
+}
+
+} // namespace
+
 bool collectModels(const base::string& folder, std::string_view extensions,
                    const base::string& skip, base::vector<BatchInput>& inputs,
                    base::string& error) {
@@ -223,10 +251,15 @@ bool collectModels(const base::string& folder, std::string_view extensions,
                 it.disable_recursion_pending();
             continue;
         }
-        if (!entry.is_regular_file(ignored) ||
-            !base::fs::hasExtensionIn(base::fs::innerName(path), extensions))
+        if (!entry.is_regular_file(ignored))
             continue;
-        found.push_back({path, base::string(entry.path().lexically_relative(root).string()), {}});
+        const base::string name(entry.path().lexically_relative(root).string());
+        if (base::fs::isArchiveName(path)) {
+            addArchiveMembers(path, name, extensions, found);
+            continue;
+        }
+        if (base::fs::hasExtensionIn(base::fs::innerName(path), extensions))
+            found.push_back({path, name, {}});
     }
     if (failure) {
         error = base::format("cannot read the folder '{}': {}", folder, failure.message());

@@ -27,6 +27,7 @@
 #include "scene_features.h"
 #include "scene_import.h"
 #include "scene_interfaces.h"
+#include "stream/b_fs_archive.h"
 #include "texture_extract.h"
 
 #include <sys/stat.h>
@@ -267,6 +268,10 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
                                                                  : switches.verbose->value());
     else if (host::isOn(switches.quiet))
         hostLog.setShownLevel(base::logError);
+    // What an archive member may expand to follows the memory cap, so a
+    // decompression bomb fails at the cap the user gave.
+    if (switches.maxMemory->isSet() && switches.maxMemory->value() > 0)
+        base::fs::setArchiveMemoryLimit(std::uint64_t(switches.maxMemory->value()) << 20);
 
     if (const auto* read = more.read; read->isSet()) {
         if (!positional.empty())

@@ -24,9 +24,10 @@ struct ImportRun {
     std::string err;
 };
 
-ImportRun importModel(const fs::path& model, const fs::path& errFile) {
-    const std::string command = "'" SCENE_IMPORT_EXE "' '" + model.string() + "' -o - 2>'" +
-                                errFile.string() + "' </dev/null";
+ImportRun importModel(const fs::path& model, const fs::path& errFile,
+                      const std::string& switches = {}) {
+    const std::string command = "'" SCENE_IMPORT_EXE "' " + switches + " '" + model.string() +
+                                "' -o - 2>'" + errFile.string() + "' </dev/null";
     ImportRun run;
     FILE* pipe = popen(command.c_str(), "r");
     if (!pipe)
@@ -153,6 +154,18 @@ TEST_F(ArchiveImport, ArchivesThatCannotBeImported) {
     }
     const ImportRun chosen = importModel(m_dir / "two.zip/b/box.obj", m_dir / "err");
     EXPECT_EQ(chosen.code, 0) << chosen.err;
+
+    // Content beyond --max-memory is refused while it is decoded (in-process
+    // here: the address-space cap of an isolated child does not mix with the
+    // sanitizers' shadow memory).
+    am::writeFile((m_dir / "bomb.ply.gz").string(),
+                  am::gzip(am::Bytes(std::size_t(20) << 20, std::uint8_t(0))));
+    const ImportRun bomb =
+        importModel(m_dir / "bomb.ply.gz", m_dir / "err", "--no-isolation --max-memory 16");
+    EXPECT_EQ(bomb.code, 1);
+    EXPECT_NE(bomb.err.find("expands to more than the memory limit of 16777216 bytes"),
+              std::string::npos)
+        << bomb.err;
 }
 
 } // namespace

@@ -1,4 +1,5 @@
 // How a batch names its outputs and finds its models, in-process.
+#include "archive_maker.h"
 #include "batch.h"
 
 #include <gtest/gtest.h>
@@ -59,6 +60,13 @@ TEST(BatchOutputs, ModelsBelowAFolder) {
         fs::create_directories((dir / file).parent_path());
         std::ofstream(dir / file) << "x";
     }
+    // An archive is a folder of its own; one that cannot be read stays an
+    // input, so its failure is reported.
+    archive_maker::writeZip((dir / "pack.zip").string(),
+                            {{"m/one.obj", archive_maker::textBytes("v 0 0 0\n")},
+                             {"two.ply", archive_maker::textBytes("ply\n")},
+                             {"m/tex.png", archive_maker::textBytes("png")}});
+    std::ofstream(dir / "bad.zip") << "not a zip";
     base::vector<host::BatchInput> inputs;
     base::string error;
     ASSERT_TRUE(host::collectModels(dir.string().c_str(), "ply;obj", (dir / "out").string().c_str(),
@@ -67,7 +75,10 @@ TEST(BatchOutputs, ModelsBelowAFolder) {
     std::vector<std::string> names;
     for (const host::BatchInput& input : inputs)
         names.emplace_back(input.name);
-    EXPECT_EQ(names, (std::vector<std::string>{"b/a.OBJ", "b/z.ply", "top.ply.gz"}));
+    EXPECT_EQ(names,
+              (std::vector<std::string>{"b/a.OBJ", "b/z.ply", "bad.zip", "pack.zip/m/one.obj",
+                                        "pack.zip/two.ply", "top.ply.gz"}));
+    EXPECT_EQ(inputs[3].model, (dir / "pack.zip/m/one.obj").string().c_str());
     EXPECT_FALSE(host::collectModels((dir / "missing").string().c_str(), "ply", {}, inputs, error));
     EXPECT_NE(error.find("missing"), base::string::npos);
     fs::remove_all(dir);
