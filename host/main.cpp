@@ -284,7 +284,9 @@ int run(int argc, char** argv, host::HostLog& hostLog) {
         return host::readBack(read->value(), output, summary, hostLog, host::jsonLayout(switches));
     }
     if (batch.mergeReports->isSet())
-        return host::mergeReportFiles(batch.mergeReports->value(), positional);
+        return host::mergeReportFiles(batch.mergeReports->value(), positional,
+                                      batch.reportHtml->isSet() ? batch.reportHtml->value()
+                                                                : base::string());
     if (host::wantsBatch(batch, positional.size(),
                          switches.output->isSet() ? switches.output->values().front()
                                                   : base::string())) {

@@ -1,6 +1,7 @@
 #include "report_merge.h"
 
 #include "b_format.h"
+#include "html_report.h"
 #include "output_file.h"
 
 #include <rapidjson/document.h>
@@ -122,7 +123,48 @@ bool mergeReports(std::span<const ReportText> reports, MergedReport& merged, bas
     return true;
 }
 
-int mergeReportFiles(const base::string& output, std::span<const base::string> reports) {
+bool recordsOfReport(std::string_view json, base::vector<ImportRecord>& records, double& seconds) {
+    rapidjson::Document doc;
+    doc.Parse(json.data(), json.size());
+    if (doc.HasParseError() || !doc.IsObject())
+        return false;
+    const auto list = doc.FindMember("records");
+    if (list == doc.MemberEnd() || !list->value.IsArray())
+        return false;
+    const auto total = doc.FindMember("seconds");
+    seconds = total != doc.MemberEnd() && total->value.IsNumber() ? total->value.GetDouble() : 0;
+    auto number = [](const rapidjson::Value& object, const char* key) -> double {
+        const auto found = object.FindMember(key);
+        return found != object.MemberEnd() && found->value.IsNumber() ? found->value.GetDouble()
+                                                                      : 0;
+    };
+    records.clear();
+    for (const rapidjson::Value& item : list->value.GetArray()) {
+        if (!item.IsObject())
+            continue;
+        ImportRecord& r = records.emplace_back();
+        r.model = text(item, "file");
+        r.status = text(item, "status");
+        r.reason = text(item, "reason");
+        if (const auto types = item.FindMember("types");
+            types != item.MemberEnd() && types->value.IsObject())
+            for (const auto& type : types->value.GetObject())
+                if (type.value.IsUint())
+                    r.types.emplace_back(base::string(type.name.GetString()), type.value.GetUint());
+        r.vertices = std::uint64_t(number(item, "vertices"));
+        r.faces = std::uint64_t(number(item, "faces"));
+        r.seconds = number(item, "seconds");
+        r.peakKiB = std::uint64_t(number(item, "peakMemoryKiB"));
+        r.warnings = std::uint32_t(number(item, "warnings"));
+        r.errors = std::uint32_t(number(item, "errors"));
+        r.firstWarning = text(item, "firstWarning");
+        r.output = text(item, "output");
+    }
+    return true;
+}
+
+int mergeReportFiles(const base::string& output, std::span<const base::string> reports,
+                     const base::string& page) {
     auto say = [](const base::string& message, int code) {
         std::fprintf(stderr, "scene-import: %s\n", message.c_str());
         return code;
@@ -153,7 +195,25 @@ int mergeReportFiles(const base::string& output, std::span<const base::string> r
         return say(error, 1);
     for (const base::string& problem : merged.problems)
         say(problem, 0);
-    return merged.problems.empty() ? 0 : 1;
+    int code = merged.problems.empty() ? 0 : 1;
+    if (!page.empty()) {
+        base::vector<ImportRecord> records;
+        double seconds = 0;
+        recordsOfReport(merged.json, records, seconds);
+        base::vector<base::string> names;
+        for (const ImportRecord& record : records)
+            names.push_back(record.model);
+        const base::vector<base::vector<std::uint8_t>> pictures(records.size());
+        const base::string html = reportHtml(records, names, pictures, seconds);
+        if (!writeAtomically(
+                page,
+                [&](base::Stream& stream) {
+                    return stream.write(html.data(), html.size()) == html.size();
+                },
+                error))
+            code = say(error, 1);
+    }
+    return code;
 }
 
 } // namespace host

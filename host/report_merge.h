@@ -5,8 +5,10 @@
 #pragma once
 
 #include "b_memory.h"
+#include "import_record.h"
 
 #include <span>
+#include <string_view>
 #include <utility>
 
 namespace host {
@@ -26,9 +28,16 @@ struct MergedReport {
 // the batch into different numbers of shards.
 bool mergeReports(std::span<const ReportText> reports, MergedReport& merged, base::string& error);
 
-// scene-import --merge-reports OUT REPORT...: 0 when the reports make one
-// whole batch, 1 when something is missing or doubled (the merged document
-// is still written) or a report cannot be read, 2 when no report is given.
-int mergeReportFiles(const base::string& output, std::span<const base::string> reports);
+// The records of a report document (a shard's or a merged one) and its
+// seconds; false when it is not one.
+bool recordsOfReport(std::string_view json, base::vector<ImportRecord>& records, double& seconds);
+
+// scene-import --merge-reports OUT REPORT... [--report-html PAGE]: 0 when the
+// reports make one whole batch, 1 when something is missing or doubled (the
+// merged document is still written) or a report cannot be read, 2 when no
+// report is given. With a page path, the whole library's page is written
+// too (cards without thumbnails: the shards' children drew them).
+int mergeReportFiles(const base::string& output, std::span<const base::string> reports,
+                     const base::string& page = {});
 
 } // namespace host

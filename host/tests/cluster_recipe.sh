@@ -39,9 +39,12 @@ echo "cluster recipe: $count models"
 mkdir -p "$work/reports"
 parallel -j 4 "$host" -q -j 1 --batch "$work/in" -o "$work/out/" --shard {}/4 \
     --report "$work/reports/shard-{}.json" ::: 1 2 3 4 >/dev/null
-"$host" --merge-reports "$work/merged.json" "$work"/reports/shard-*.json 2>"$work/merge.err"
+"$host" --merge-reports "$work/merged.json" "$work"/reports/shard-*.json \
+    --report-html "$work/library.html" 2>"$work/merge.err"
 code=$?
 check "the merge of 4 shards is whole (exit $code)" [ $code -eq 0 ]
+check "the library's page has a card per file" \
+    [ "$(grep -c '<div class="card' "$work/library.html")" -eq "$count" ]
 check "the merged report equals the single run" python3 - "$work/single.json" "$work/merged.json" \
     "$work/single" "$work/out" "$count" <<'PY'
 import json, sys
