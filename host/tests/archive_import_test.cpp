@@ -3,6 +3,8 @@
 // fail the import with their clear message.
 #include "archive_maker.h"
 
+#include "child_run.h"
+
 #include <gtest/gtest.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -18,28 +20,13 @@ namespace am = archive_maker;
 
 const fs::path corpus = "/usr/share/assimp/models";
 
-struct ImportRun {
-    int code = -1;
-    std::string out;
-    std::string err;
-};
+using ImportRun = hosttest::CommandRun;
 
 ImportRun importModel(const fs::path& model, const fs::path& errFile,
                       const std::string& switches = {}) {
     const std::string command = "'" SCENE_IMPORT_EXE "' " + switches + " '" + model.string() +
                                 "' -o - 2>'" + errFile.string() + "' </dev/null";
-    ImportRun run;
-    FILE* pipe = popen(command.c_str(), "r");
-    if (!pipe)
-        return run;
-    char buffer[65536];
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        run.out.append(buffer, n);
-    const int status = pclose(pipe);
-    run.code = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-    const am::Bytes err = am::readFile(errFile.string());
-    run.err.assign(err.begin(), err.end());
-    return run;
+    return hosttest::runCommand(command, errFile);
 }
 
 std::string replaced(std::string text, const std::string& from, const std::string& to) {

@@ -1,5 +1,6 @@
 // The host as its users see it: scene-import runs as a child process judged by
 // its exit code, standard streams and JSON; the --summary counts in-process.
+#include "child_run.h"
 #include "listing.h"
 #include "scene_interfaces.h"
 #include "scene_schema.h"
@@ -28,15 +29,10 @@ namespace fs = std::filesystem;
 const std::string sample = std::string(SCENE_SAMPLES_DIR) + "/sample.gltf";
 
 std::string readFile(const fs::path& path) {
-    std::ifstream in(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(in), {});
+    return hosttest::readText(path);
 }
 
-struct HostRun {
-    int code = -1;
-    std::string out;
-    std::string err;
-};
+using HostRun = hosttest::CommandRun;
 
 class HostTest : public ::testing::Test {
 protected:
@@ -68,18 +64,8 @@ protected:
             command += " '" + a + "'";
         }
         const fs::path errPath = m_dir / "stderr";
-        HostRun run;
-        FILE* pipe =
-            popen((command + " 2>'" + errPath.string() + "' </dev/null" + suffix).c_str(), "r");
-        if (!pipe)
-            return run;
-        char buffer[4096];
-        for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-            run.out.append(buffer, n);
-        const int status = pclose(pipe);
-        run.code = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-        run.err = readFile(errPath);
-        return run;
+        return hosttest::runCommand(command + " 2>'" + errPath.string() + "' </dev/null" + suffix,
+                                    errPath);
     }
 
     // Runs with 'args' and parses the JSON document it writes to standard output.
@@ -575,11 +561,11 @@ l = count(sys.argv[2], True)
 print(k['pairs'], l['lost'], l['pairs'] - l['attributes'] - l['value'], l['attributes'])
 )";
     std::string out;
-    FILE* pipe = popen(("python3 '" + (m_dir / "count.py").string() + "' '" +
-                        (m_dir / "keyed.json").string() + "' '" + (m_dir / "list.json").string() +
-                        "'")
-                           .c_str(),
-                       "r");
+    FILE* pipe =
+        popen(("python3 '" + (m_dir / "count.py").string() + "' '" +
+               (m_dir / "keyed.json").string() + "' '" + (m_dir / "list.json").string() + "'")
+                  .c_str(),
+              "r");
     ASSERT_NE(pipe, nullptr);
     char buffer[256];
     for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)

@@ -4,7 +4,9 @@
 #include "batch_shard.h"
 #include "report_merge.h"
 
+#include "child_run.h"
 #include <fcntl.h>
+
 #include <gtest/gtest.h>
 #include <rapidjson/document.h>
 #include <sys/stat.h>
@@ -266,16 +268,11 @@ TEST(MergedReports, EqualTheSingleRunAndNameWhatIsWrong) {
 }
 
 int hostExit(const std::string& args, std::string& err) {
-    const std::string command = "'" SCENE_IMPORT_EXE "' " + args + " 2>&1 >/dev/null";
-    FILE* pipe = popen(command.c_str(), "r");
-    if (!pipe)
-        return -1;
-    char buffer[1024];
-    err.clear();
-    for (std::size_t n; (n = std::fread(buffer, 1, sizeof buffer, pipe)) > 0;)
-        err.append(buffer, n);
-    const int status = pclose(pipe);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+    // Standard error through the pipe, standard output dropped.
+    const hosttest::CommandRun run =
+        hosttest::runCommand("'" SCENE_IMPORT_EXE "' " + args + " 2>&1 >/dev/null");
+    err = run.out;
+    return run.code;
 }
 
 TEST_F(BatchFiles, BadShardSwitchesAreUsageErrors) {

@@ -121,10 +121,7 @@ constexpr const char* objWithNormals = "v 0 0 0\nv 1 0 0\nv 0 1 0\nv 0 0 1\n"
 
 struct ImportFixture : testing::Test {
     void SetUp() override {
-        folder = fsys::path(testing::TempDir()) /
-                 ("as_import_" + std::to_string(::getpid()) + "_" +
-                  testing::UnitTest::GetInstance()->current_test_info()->name());
-        fsys::create_directories(folder);
+        folder = as::meshtest::testFolder("as_import_");
         factory = as::meshtest::loadedFactory("import");
     }
     void TearDown() override {

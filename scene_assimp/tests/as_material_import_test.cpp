@@ -67,10 +67,7 @@ constexpr const char* mtl = "newmtl shiny\n"
 
 struct MaterialImport : testing::Test {
     void SetUp() override {
-        folder = fsys::path(testing::TempDir()) /
-                 ("as_material_" + std::to_string(::getpid()) + "_" +
-                  testing::UnitTest::GetInstance()->current_test_info()->name());
-        fsys::create_directories(folder);
+        folder = as::meshtest::testFolder("as_material_");
         factory = as::meshtest::loadedFactory((folder.string() + "/").c_str());
     }
     void TearDown() override {

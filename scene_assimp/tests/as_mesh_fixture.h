@@ -14,8 +14,12 @@
 #include <assimp/scene.h>
 #include <gtest/gtest.h>
 
+#include <unistd.h>
+
 #include <algorithm>
+#include <filesystem>
 #include <initializer_list>
+#include <string>
 #include <vector>
 
 extern "C" std::int32_t loadScenePlugin(base::PluginFactory& factory);
@@ -59,6 +63,17 @@ inline base::ref<base::PluginFactory> loadedFactory(const char* name = "test") {
     scene::register_scene_schema(*factory);
     EXPECT_EQ(loadScenePlugin(*factory), 0);
     return factory;
+}
+
+// A fresh folder for the files of the running test, named after the process
+// and the test, so parallel test processes never share one.
+inline std::filesystem::path testFolder(const std::string& prefix) {
+    const std::filesystem::path folder =
+        std::filesystem::path(testing::TempDir()) /
+        (prefix + std::to_string(::getpid()) + "_" +
+         testing::UnitTest::GetInstance()->current_test_info()->name());
+    std::filesystem::create_directories(folder);
+    return folder;
 }
 
 namespace names = scene::names;
